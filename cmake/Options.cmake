@@ -1,0 +1,43 @@
+# What a builder may choose, and the compiler settings that follow from it.
+
+option(LINEFOLD_WARNINGS_AS_ERRORS "Warnings end the build" OFF)
+option(LINEFOLD_FUZZ "Build the fuzzers (clang)" OFF)
+set(LINEFOLD_SANITIZE "" CACHE STRING "Sanitizers to build with, such as address,undefined")
+
+# Constants of the built daemon; platform/BuildConstants.h.in hands them to the code. There is no
+# run-time override.
+set(LINEFOLD_CONFIGURATION_HOST "configuration.vendra.example" CACHE STRING
+    "Host of the index server of the service databases")
+set(LINEFOLD_HEARTBEAT_HOST "192.0.2.1" CACHE STRING "IPv4 address that the heartbeat pings")
+set(LINEFOLD_LIBRARY_DIR "/usr/lib/linefold" CACHE STRING "Folder of modules loaded when used")
+set(LINEFOLD_CONFIGURATION_DIR "/etc/linefold" CACHE STRING "Folder of the configuration files")
+set(LINEFOLD_DEFAULT_GROUP "linefold-telephony" CACHE STRING
+    "Entitled group that lfhelper takes when root starts it")
+set(LINEFOLD_IDLE_INTERVAL "10.0" CACHE STRING "Seconds without work until the daemon leaves")
+
+set(CMAKE_CXX_FLAGS_RELEASE "-O2 -DNDEBUG")
+
+add_compile_options(
+    -Wall -Wextra -Wpedantic -Wconversion -Wshadow -Wimplicit-fallthrough
+    $<$<COMPILE_LANGUAGE:CXX>:-Wnon-virtual-dtor> $<$<COMPILE_LANGUAGE:CXX>:-Woverloaded-virtual>
+    # Neither logs nor binaries tell where they were built.
+    -ffile-prefix-map=${CMAKE_SOURCE_DIR}/=
+)
+if(CMAKE_CXX_COMPILER_ID STREQUAL "Clang")
+    add_compile_options(-Wthread-safety)
+endif()
+if(LINEFOLD_WARNINGS_AS_ERRORS)
+    add_compile_options(-Werror)
+endif()
+if(LINEFOLD_FUZZ)
+    add_compile_options(-fsanitize=fuzzer-no-link)
+endif()
+if(LINEFOLD_SANITIZE)
+    add_compile_options(-fsanitize=${LINEFOLD_SANITIZE} -fno-omit-frame-pointer
+                        -fno-sanitize-recover=all -O1)
+    add_link_options(-fsanitize=${LINEFOLD_SANITIZE})
+else()
+    # The shipped programs bring the compiler's libraries along: a cold start finds less to load.
+    add_compile_options(-ffunction-sections -fdata-sections)
+    add_link_options(-Wl,--gc-sections -Wl,-z,relro,-z,now)
+endif()

@@ -1,0 +1,30 @@
+# linefold_library(NAME SOURCES... DEPENDS...): the static library of one folder, linked only to
+# what that folder may use.
+function(linefold_library name)
+    cmake_parse_arguments(ARG "" "" "SOURCES;DEPENDS" ${ARGN})
+    add_library(${name} STATIC ${ARG_SOURCES})
+    target_include_directories(${name} PUBLIC ${CMAKE_SOURCE_DIR} ${CMAKE_BINARY_DIR}/generated)
+    target_link_libraries(${name} PUBLIC ${ARG_DEPENDS})
+endfunction()
+
+# linefold_ship(TARGET): links the compiler's own libraries statically, as shipped programs do.
+function(linefold_ship target)
+    if(NOT LINEFOLD_SANITIZE)
+        target_link_options(${target} PRIVATE -static-libstdc++ -static-libgcc)
+    endif()
+endfunction()
+
+# The whole core: the request table names the handlers, and the handlers use the server.
+set(LINEFOLD_CORE
+    "$<LINK_GROUP:RESCAN,carrier,files,voicemail,location,heartbeat,lasd,helper_server>")
+
+# linefold_test(NAME SOURCES... LIBS...): one GoogleTest binary, registered as one test.
+function(linefold_test)
+    cmake_parse_arguments(ARG "" "NAME" "SOURCES;LIBS" ${ARGN})
+    add_executable(${ARG_NAME} ${ARG_SOURCES})
+    target_include_directories(${ARG_NAME} PRIVATE ${CMAKE_SOURCE_DIR})
+    target_link_libraries(${ARG_NAME} PRIVATE ${ARG_LIBS} GTest::gtest GTest::gtest_main)
+    add_test(NAME ${ARG_NAME} COMMAND ${ARG_NAME})
+    set_tests_properties(${ARG_NAME} PROPERTIES TIMEOUT 300)
+    add_dependencies(tests-all ${ARG_NAME})
+endfunction()
