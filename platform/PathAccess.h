@@ -1,0 +1,47 @@
+// A path that somebody else named, resolved once so that nobody can walk us elsewhere.
+#pragma once
+
+#include <cstdint>
+#include <memory>
+#include <string>
+#include <string_view>
+
+namespace platform {
+
+struct FileStatus {
+    std::uint32_t mode = 0;  ///< type and permission bits, as in st_mode
+    std::uint32_t uid = 0;
+    std::uint32_t gid = 0;
+};
+
+/// The parent directory of a path, held open, and the name of the last step.
+///
+/// The daemon is root and works below folders that the mobile user owns. On the way a symbolic link
+/// is followed if root owns it, or if it leads to something that the link's own owner owns;
+/// otherwise EPERM. ".." is taken as it stands. A resolution that failed is answered by every
+/// operation with its error. All operations return 0 or an errno value, and none follows a link in
+/// the last step.
+class PathAccess {
+public:
+    explicit PathAccess(std::string_view path);
+    PathAccess(PathAccess&&) noexcept;
+    PathAccess& operator=(PathAccess&&) noexcept;
+    PathAccess(const PathAccess&) = delete;
+    PathAccess& operator=(const PathAccess&) = delete;
+    ~PathAccess();
+
+    /// lstat(2); `*status` is written on success only.
+    [[nodiscard]] int lstat(FileStatus* status) const;
+
+    /// remove(3): a file, a link, or an empty directory.
+    [[nodiscard]] int remove() const;
+
+    /// symlink(2): makes the path a link with these contents; EEXIST when something is there.
+    [[nodiscard]] int symlink(std::string_view contents) const;
+
+private:
+    struct State;
+    std::unique_ptr<State> state_;
+};
+
+}  // namespace platform
