@@ -1,0 +1,36 @@
+// The simulated file tree. The world's own view: every link is followed, whoever owns it.
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <string_view>
+
+namespace sim {
+
+inline constexpr std::uint32_t kDirectory = 0040000;
+inline constexpr std::uint32_t kFifo = 0010000;
+inline constexpr std::uint32_t kRegular = 0100000;
+inline constexpr std::uint32_t kLink = 0120000;
+inline constexpr std::uint32_t kSocket = 0140000;
+inline constexpr std::uint32_t kCharacterDevice = 0020000;
+inline constexpr std::uint32_t kBlockDevice = 0060000;
+
+struct FileNode {
+    std::uint32_t mode = 0;
+    std::uint32_t owner = 0;
+    std::string contents{};  ///< of a file, or where a link leads
+
+    [[nodiscard]] bool is(std::uint32_t type) const { return (mode & 0170000) == type; }
+};
+
+/// Puts something at a path whose folder exists, in place of what is there.
+void MakeFile(std::string_view path, FileNode node);
+void MakeDirectory(std::string_view path, std::uint32_t owner = 0);
+void MakeLink(std::string_view path, std::string_view target, std::uint32_t owner = 0);
+void RemoveFile(std::string_view path);
+
+/// What stands at a path; a link in the last step is not followed.
+[[nodiscard]] std::optional<FileNode> FileAt(std::string_view path);
+
+}  // namespace sim

@@ -1,0 +1,20 @@
+// Apart from the other services: a program of its own users brings its own.
+#include "platform/UserDatabase.h"
+
+#include "platform/sim/Services.h"
+
+namespace platform {
+
+std::optional<UserRecord> UserRecordByName(const char* name) {
+    const auto& users = sim::TheServices().users;
+    const auto user = users.find(name);
+    return user == users.end() ? std::nullopt : std::optional(user->second.record);
+}
+
+std::optional<std::string> CopyHomeDirectoryForUser(const char* name) {
+    const auto& users = sim::TheServices().users;
+    const auto user = users.find(name);
+    return user == users.end() ? std::nullopt : user->second.home;
+}
+
+}  // namespace platform
