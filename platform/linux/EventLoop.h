@@ -1,0 +1,118 @@
+// The loop behind run loops and serial queues: one level-triggered epoll set, timers and tasks.
+#pragma once
+
+#include <atomic>
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <mutex>
+#include <vector>
+
+#include "platform/RunLoop.h"
+#include "platform/linux/OwnedFd.h"
+
+namespace platform {
+
+class EventLoop;
+
+/// A descriptor that a loop waits for.
+class EventSource : public RunLoopSource {
+public:
+    virtual ~EventSource() = default;
+    EventSource(const EventSource&) = delete;
+    EventSource& operator=(const EventSource&) = delete;
+
+    /// Called on the loop's thread with the ready EPOLL bits.
+    virtual void ready(std::uint32_t events) = 0;
+
+    void leaveLoop();
+
+    [[nodiscard]] bool isValid() const { return isValid_; }
+
+    [[nodiscard]] int descriptor() const { return descriptor_; }
+
+protected:
+    EventSource(int descriptor, std::uint32_t interest)
+        : descriptor_(descriptor), interest_(interest) {}
+
+    /// Changes the EPOLL bits that are waited for.
+    void setInterest(std::uint32_t interest);
+
+private:
+    friend class EventLoop;
+
+    EventLoop* loop_ = nullptr;
+    const int descriptor_;
+    std::uint32_t interest_;
+    std::uint32_t serial_ = 0;  // tells this source from others that had its descriptor
+    bool isValid_ = true;
+};
+
+class EventTimer final : public RunLoopTimer {
+public:
+    EventTimer(AbsoluteTime fireDate, double interval, std::function<void()> callout)
+        : fireDate_(fireDate), interval_(interval), callout_(std::move(callout)) {}
+
+    ~EventTimer() = default;
+
+    void cancel() { state_ = State::kInvalid; }
+
+    [[nodiscard]] bool isArmed() const { return state_ == State::kArmed; }
+
+    [[nodiscard]] AbsoluteTime fireDate() const { return fireDate_; }
+
+    /// On the loop's thread. Returns whether the timer goes on.
+    bool fire(AbsoluteTime now);
+
+private:
+    enum class State : std::uint8_t { kArmed, kFiring, kInvalid };
+
+    AbsoluteTime fireDate_;
+    const double interval_;
+    const std::function<void()> callout_;
+    std::atomic<State> state_ = State::kArmed;
+};
+
+class EventLoop final : public RunLoop {
+public:
+    enum class WhenEmpty : bool { kFinish, kWait };
+
+    EventLoop();
+    ~EventLoop() = default;
+
+    /// The loop of the calling thread, or null while it has none.
+    static inline thread_local EventLoop* ofThisThread = nullptr;
+
+    RunLoopResult serve(double seconds, AfterSource afterSource, WhenEmpty whenEmpty);
+    void requestStop();
+    void attach(const std::shared_ptr<EventSource>& source);
+    void detach(EventSource& source);
+    void modify(const EventSource& source);
+    void attachTimer(std::shared_ptr<EventTimer> timer);
+    void enqueue(std::function<void()> task);
+
+private:
+    [[nodiscard]] bool isStopped() const { return stopRequested_.load(std::memory_order_acquire); }
+
+    void runTasks();
+    void fireTimers();
+    void wake();
+    [[nodiscard]] double secondsToWait(AbsoluteTime deadline);
+    [[nodiscard]] bool isEmpty();
+    [[nodiscard]] bool serveSources(double seconds);
+
+    OwnedFd epoll_;
+    OwnedFd wake_;                                       // an eventfd
+    std::vector<std::shared_ptr<EventSource>> sources_;  // by descriptor; on the loop's thread
+    std::uint32_t lastSerial_ = 0;
+    std::size_t sourceCount_ = 0;
+    std::atomic<bool> stopRequested_ = false;
+    std::atomic<bool> isWoken_ = false;
+
+    std::mutex lock_;
+    std::vector<std::function<void()>> tasks_;         // under lock_
+    std::vector<std::shared_ptr<EventTimer>> timers_;  // under lock_
+    std::atomic<bool> hasWork_ = false;                // tasks_ or timers_ may hold something
+};
+
+}  // namespace platform
