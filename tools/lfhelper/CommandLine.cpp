@@ -1,0 +1,135 @@
+#include "tools/lfhelper/CommandLine.h"
+
+#include <algorithm>
+#include <array>
+
+namespace lfhelper {
+namespace {
+
+enum class Takes { kNothing, kValue };
+
+struct KnownOption {
+    std::string_view name;
+    Takes takes;
+    /// The one command that it belongs to; empty for all.
+    std::string_view command;
+};
+
+constexpr std::array<KnownOption, 7> kKnownOptions{{
+    {"help", Takes::kNothing, ""},
+    {"version", Takes::kNothing, ""},
+    {"json", Takes::kNothing, ""},
+    {"group", Takes::kValue, ""},
+    {"service", Takes::kValue, ""},
+    {"complex", Takes::kNothing, "raw"},
+    {"claim-size", Takes::kValue, "raw"},
+}};
+
+const KnownOption* FindKnownOption(std::string_view name) {
+    const auto found = std::ranges::find(kKnownOptions, name, &KnownOption::name);
+    return found == kKnownOptions.end() ? nullptr : &*found;
+}
+
+bool LooksLikeOption(std::string_view argument) {
+    const bool isNumber = argument.size() > 1 && argument[1] >= '0' && argument[1] <= '9';
+    return argument.size() > 1 && argument[0] == '-' && !isNumber;
+}
+
+class Parser {
+public:
+    explicit Parser(std::span<const char* const> arguments) : rest_(arguments) {}
+
+    CommandLine parse() {
+        bool optionsEnded = false;
+        while (!rest_.empty()) {
+            const std::string_view argument = next();
+            if (!optionsEnded && argument == "--") {
+                optionsEnded = true;
+            } else if (!optionsEnded && LooksLikeOption(argument)) {
+                takeOption(argument);
+            } else {
+                takeOperand(argument);
+            }
+        }
+        checkCommands();
+        return std::move(line_);
+    }
+
+private:
+    std::string_view next() {
+        const std::string_view argument = rest_.front();
+        rest_ = rest_.subspan(1);
+        return argument;
+    }
+
+    void fail(std::string message) {
+        // The first mistake is the one to mend first.
+        if (line_.error.empty()) {
+            line_.error = std::move(message);
+        }
+    }
+
+    void takeOperand(std::string_view argument) {
+        if (!hasCommand_) {
+            hasCommand_ = true;
+            line_.command = argument;
+        } else {
+            line_.operands.emplace_back(argument);
+        }
+    }
+
+    void takeOption(std::string_view argument) {
+        const std::size_t equals = argument.find('=');
+        const bool hasValue = equals != std::string_view::npos;
+        const std::string_view written = argument.substr(0, equals);
+        const auto* const option =
+            written.starts_with("--") ? FindKnownOption(written.substr(2)) : nullptr;
+        if (option == nullptr) {
+            fail("there is no option " + std::string(written));
+        } else if (option->takes == Takes::kNothing && hasValue) {
+            fail("the option " + std::string(written) + " takes no value");
+        } else if (option->takes == Takes::kValue && !hasValue && rest_.empty()) {
+            fail("the option " + std::string(written) + " needs a value");
+        } else {
+            std::string value;
+            if (option->takes == Takes::kValue) {
+                value = hasValue ? argument.substr(equals + 1) : next();
+            }
+            line_.options.push_back({option->name, std::move(value)});
+        }
+    }
+
+    void checkCommands() {
+        for (const auto& option : line_.options) {
+            const std::string_view command = FindKnownOption(option.name)->command;
+            if (!command.empty() && command != line_.command) {
+                fail("the option --" + std::string(option.name) + " belongs to the command " +
+                     std::string(command));
+            }
+        }
+    }
+
+    std::span<const char* const> rest_;
+    CommandLine line_;
+    bool hasCommand_ = false;
+};
+
+}  // namespace
+
+const CommandLine::Option* CommandLine::find(std::string_view name) const {
+    const auto found = std::find_if(options.rbegin(), options.rend(), [name](const Option& option) {
+        return option.name == name;
+    });
+    return found == options.rend() ? nullptr : &*found;
+}
+
+std::optional<std::string> CommandLine::value(std::string_view name) const {
+    const Option* const option = find(name);
+    return option == nullptr ? std::nullopt : std::optional(option->value);
+}
+
+CommandLine ParseCommandLine(std::span<const char* const> arguments) {
+    return Parser(arguments).parse();
+}
+
+}  // namespace lfhelper

@@ -1,0 +1,216 @@
+#include "tools/lfhelper/Subcommands.h"
+
+#include <unistd.h>
+
+#include <algorithm>
+#include <array>
+#include <charconv>
+#include <optional>
+#include <system_error>
+#include <vector>
+
+#include "Helper/Shared/Server/MessageLayouts.h"
+#include "tools/lfhelper/HexDump.h"
+
+namespace lfhelper {
+namespace {
+
+Preparation PrepareCheckIn(const CommandLine& /*line*/) {
+    return {.request = [](LFMobileHelper* helper) {
+        return Answer{.code = LFMobileHelperCheckIn(helper)};
+    }};
+}
+
+Preparation PrepareLinkCarrierBundle(const CommandLine& line) {
+    const std::string domain = line.operands.size() > 2 ? line.operands[2] : "";
+    return {.request = [target = line.operands[0], link = line.operands[1], domain](
+                           LFMobileHelper* helper) {
+        Answer answer{.code = LFMobileHelperLinkCarrierBundle(
+                          helper, target.c_str(), link.c_str(), domain.c_str())};
+        answer.fields.add("target", target);
+        answer.fields.add("link", link);
+        answer.fields.add("domain", domain);
+        return answer;
+    }};
+}
+
+Preparation PrepareCreateSymlink(const CommandLine& line) {
+    return {.request = [target = line.operands[0],
+                        link = line.operands[1]](LFMobileHelper* helper) {
+        Answer answer{.code = LFMobileHelperCreateSymlink(helper, target.c_str(), link.c_str())};
+        answer.fields.add("target", target);
+        answer.fields.add("link", link);
+        return answer;
+    }};
+}
+
+Preparation PrepareRemovePreferenceDomain(const CommandLine& line) {
+    const std::string domain = line.operands.size() > 1 ? line.operands[1] : "";
+    return {.request = [path = line.operands[0], domain](LFMobileHelper* helper) {
+        Answer answer{
+            .code = LFMobileHelperRemovePreferenceDomain(helper, path.c_str(), domain.c_str())};
+        answer.fields.add("path", path);
+        answer.fields.add("domain", domain);
+        return answer;
+    }};
+}
+
+/// A decimal number, or a hexadecimal one behind 0x.
+template <typename Number>
+std::optional<Number> ParseNumber(std::string_view text) {
+    const bool isHex = text.starts_with("0x") || text.starts_with("0X");
+    const std::string_view digits = isHex ? text.substr(2) : text;
+    Number number{};
+    const char* const end = digits.data() + digits.size();
+    const auto [rest, error] = std::from_chars(digits.data(), end, number, isHex ? 16 : 10);
+    const bool hasSignBehindPrefix = isHex && digits.starts_with('-');
+    return error == std::errc{} && rest == end && !hasSignBehindPrefix ? std::optional(number)
+                                                                       : std::nullopt;
+}
+
+std::vector<std::byte> MakeMessage(const platform::MachMsgHeader& header, ByteSpan body) {
+    std::vector<std::byte> message(sizeof header + body.size());
+    platform::Store(std::span(message), 0, header);
+    std::ranges::copy(body, message.begin() + sizeof header);
+    return message;
+}
+
+JsonObject HeaderFields(ByteSpan reply) {
+    const auto header = platform::Load<platform::MachMsgHeader>(reply, 0);
+    JsonObject fields;
+    fields.add("bits", std::int64_t{header.bits});
+    fields.add("size", std::int64_t{header.size});
+    fields.add("id", std::int64_t{header.id});
+    return fields;
+}
+
+Answer AnswerOfReply(ByteSpan reply, bool hasDescriptor) {
+    Answer answer{.code = ReturnCodeOf(reply).value_or(LF_MOBILE_HELPER_ERROR_INVALID_REPLY),
+                  .text = AnnotatedReply(reply)};
+    if (hasDescriptor) {
+        answer.text += "and a descriptor beside it\n";
+    }
+    if (reply.size() >= sizeof(platform::MachMsgHeader)) {
+        answer.fields.add("header", HeaderFields(reply));
+    }
+    answer.fields.add("reply", ToHex(reply));
+    answer.fields.add("descriptors", std::int64_t{hasDescriptor ? 1 : 0});
+    return answer;
+}
+
+Answer SendAndDump(LFMobileHelper* helper, std::span<const std::byte> message) {
+    // A reply, the data behind it, and as much again for one that breaks the rules.
+    constexpr std::size_t kCapacity =
+        std::size_t{2} * (platform::kMaxReplySize + platform::kMaxInlineData);
+    std::vector<std::byte> reply(kCapacity);
+    std::size_t size = 0;
+    int descriptor = -1;
+    const std::int32_t code = LFMobileHelperSendMessage(
+        helper, message.data(), message.size(), reply.data(), reply.size(), &size, &descriptor);
+    if (descriptor >= 0) {
+        (void)close(descriptor);
+    }
+    return code == LF_MOBILE_HELPER_SUCCESS
+               ? AnswerOfReply(ByteSpan(reply).first(size), descriptor >= 0)
+               : Answer{.code = code};
+}
+
+Preparation PrepareRaw(const CommandLine& line) {
+    const auto id = ParseNumber<std::int32_t>(line.operands[0]);
+    if (!id) {
+        return {.error = "ID must be a number of 32 bits, not \"" + line.operands[0] + "\""};
+    }
+    const auto body = FromHex(line.operands.size() > 1 ? line.operands[1] : "");
+    if (!body) {
+        return {.error = "HEX must be pairs of hexadecimal digits"};
+    }
+    const auto claimed = line.value("claim-size");
+    const auto size =
+        claimed ? ParseNumber<std::uint32_t>(*claimed)
+                : static_cast<std::uint32_t>(sizeof(platform::MachMsgHeader) + body->size());
+    if (!size) {
+        return {.error = "the value of --claim-size must be a number of 32 bits"};
+    }
+    const std::uint32_t bits = line.has("complex") ? platform::MACH_MSGH_BITS_COMPLEX : 0;
+    const auto message = MakeMessage({.bits = bits, .size = *size, .id = *id}, *body);
+    return {.request = [message](LFMobileHelper* helper) { return SendAndDump(helper, message); }};
+}
+
+constexpr std::array<Subcommand, 5> kSubcommands{{
+    {"check-in",
+     "",
+     "ask whether the service is there and takes this caller",
+     "Connects and checks in, and asks for nothing else.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper check-in\n"
+     "  lfhelper --group linefold-telephony --json check-in\n",
+     0,
+     0,
+     PrepareCheckIn},
+    {"link-carrier-bundle",
+     "TARGET LINK [DOMAIN]",
+     "point a carrier or operator bundle link at a bundle",
+     "Replaces the link LINK, which must be one of the bundle links, by one that points at "
+     "TARGET,\n"
+     "and drops the cached preferences of DOMAIN.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper link-carrier-bundle '/System/Library/Carrier Bundles/Example.bundle' \\\n"
+     "      '/private/var/mobile/Library/Carrier Bundle.bundle' com.vendra.carrier\n",
+     2,
+     3,
+     PrepareLinkCarrierBundle},
+    {"create-symlink",
+     "TARGET LINK",
+     "make a symbolic link, in place of a file that may be there",
+     "Removes what is at LINK and makes a symbolic link to TARGET there.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper create-symlink /private/var/mobile/Library/Logs /private/var/mobile/logs\n",
+     2,
+     2,
+     PrepareCreateSymlink},
+    {"remove-preference-domain",
+     "PATH [DOMAIN]",
+     "remove the file of a preference domain",
+     "Drops the cached preferences of DOMAIN, then removes PATH, which must be a carrier path.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper remove-preference-domain \\\n"
+     "      /private/var/mobile/Library/Preferences/com.vendra.carrier.plist com.vendra.carrier\n",
+     1,
+     2,
+     PrepareRemovePreferenceDomain},
+    {"raw",
+     "[--complex] [--claim-size N] ID [HEX]",
+     "send a message as it is, and show the reply field by field",
+     "Checks in, then sends a message to the private port: a header with the id ID (decimal, or\n"
+     "hexadecimal behind 0x) and the bytes HEX behind it, where blanks and colons may stand "
+     "between\n"
+     "the bytes. The message is not looked at before.\n"
+     "\n"
+     "  --complex         set the bit that announces a descriptor\n"
+     "  --claim-size N    write N as the size of the message instead of the true one\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper raw 8683561\n"
+     "  lfhelper raw 8683562 '0000000001000000 01000000'\n"
+     "  lfhelper raw --complex --claim-size 568 0x848023\n",
+     1,
+     2,
+     PrepareRaw},
+}};
+
+}  // namespace
+
+std::span<const Subcommand> Subcommands() {
+    return kSubcommands;
+}
+
+const Subcommand* FindSubcommand(std::string_view name) {
+    const auto found = std::ranges::find(kSubcommands, name, &Subcommand::name);
+    return found == kSubcommands.end() ? nullptr : &*found;
+}
+
+}  // namespace lfhelper
