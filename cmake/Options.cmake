@@ -24,7 +24,7 @@ add_compile_options(
     -ffile-prefix-map=${CMAKE_SOURCE_DIR}/=
 )
 if(CMAKE_CXX_COMPILER_ID STREQUAL "Clang")
-    add_compile_options(-Wthread-safety)
+    add_compile_options($<$<COMPILE_LANGUAGE:CXX>:-Wthread-safety>)
 endif()
 if(LINEFOLD_WARNINGS_AS_ERRORS)
     add_compile_options(-Werror)

@@ -18,13 +18,28 @@ endfunction()
 set(LINEFOLD_CORE
     "$<LINK_GROUP:RESCAN,carrier,files,voicemail,location,heartbeat,lasd,helper_server>")
 
-# linefold_test(NAME SOURCES... LIBS...): one GoogleTest binary, registered as one test.
-function(linefold_test)
+# linefold_test_program(NAME SOURCES... LIBS...): a GoogleTest binary. Its headers are compiled once
+# for all of them.
+function(linefold_test_program)
     cmake_parse_arguments(ARG "" "NAME" "SOURCES;LIBS" ${ARGN})
     add_executable(${ARG_NAME} ${ARG_SOURCES})
     target_include_directories(${ARG_NAME} PRIVATE ${CMAKE_SOURCE_DIR})
     target_link_libraries(${ARG_NAME} PRIVATE ${ARG_LIBS} GTest::gtest GTest::gtest_main)
+    if(NOT TARGET test_headers)
+        # A program, since what uses the headers are programs.
+        add_executable(test_headers ${CMAKE_SOURCE_DIR}/tests/support/TestHeaders.cpp)
+        target_link_libraries(test_headers PRIVATE GTest::gtest GTest::gtest_main)
+        target_precompile_headers(test_headers PRIVATE
+            <gtest/gtest.h> <filesystem> <functional> <map> <span> <string> <vector>)
+    endif()
+    target_precompile_headers(${ARG_NAME} REUSE_FROM test_headers)
+    add_dependencies(tests-all ${ARG_NAME})
+endfunction()
+
+# linefold_test(NAME SOURCES... LIBS...): the same, registered as one test.
+function(linefold_test)
+    cmake_parse_arguments(ARG "" "NAME" "" ${ARGN})
+    linefold_test_program(${ARGN})
     add_test(NAME ${ARG_NAME} COMMAND ${ARG_NAME})
     set_tests_properties(${ARG_NAME} PROPERTIES TIMEOUT 300)
-    add_dependencies(tests-all ${ARG_NAME})
 endfunction()
