@@ -14,6 +14,7 @@
 
 #include "platform/VirtualMemory.h"
 #include "platform/linux/DescriptorKind.h"
+#include "platform/linux/FreedMemory.h"
 #include "platform/linux/PortSpace.h"
 
 namespace platform {
@@ -82,7 +83,8 @@ public:
     Outgoing(Outgoing&& other) noexcept
         : reply_(other.reply_),
           descriptor_(std::move(other.descriptor_)),
-          memory_(std::exchange(other.memory_, {})) {}
+          memory_(std::exchange(other.memory_, {})),
+          isBulk_(other.isBulk_) {}
 
     ~Outgoing() { releaseMemory(); }
 
@@ -140,6 +142,9 @@ public:
 
     [[nodiscard]] const ReplyMessage& reply() const { return reply_; }
 
+    /// Whether the data beside it is too large to ride behind it.
+    [[nodiscard]] bool isBulk() const { return isBulk_; }
+
 private:
     bool loadPort() {
         const auto name = Load<mach_port_t>(reply_.bytes, kOffsetOfDescriptor);
@@ -152,7 +157,8 @@ private:
         const auto size = Load<std::uint32_t>(reply_.bytes, kOffsetOfOutOfLineSize);
         Store(reply_.bytes, kOffsetOfDescriptor, std::uint64_t{0});  // addresses of ours stay here
         memory_ = {reinterpret_cast<std::byte*>(address), size};
-        if (size > kMaxInlineData) {
+        isBulk_ = size > kMaxInlineData;
+        if (isBulk_) {
             descriptor_ = SealedMemoryFile(memory_);
             releaseMemory();
             return descriptor_.isOpen();
@@ -168,6 +174,7 @@ private:
     ReplyMessage reply_;
     OwnedFd descriptor_;
     std::span<std::byte> memory_;
+    bool isBulk_ = false;
 };
 
 MessageSource::MessageSource(int descriptor, const Service& service)
@@ -243,8 +250,13 @@ MessageSource::Step MessageSource::answer(std::size_t arrived,
     service_.callout(request, reply, service_.context);
     Outgoing outgoing(reply);
     outgoing.load();
+    // A memory file that came is still here; a port would have become a name.
+    const bool wasBulk = request.descriptor >= 0 || outgoing.isBulk();
     const Step step = isValid() ? sendOrKeep(std::move(outgoing)) : Step::kClose;
     CloseForeignDescriptor(OwnedFd(request.descriptor));
+    if (wasBulk) {
+        ReturnFreedMemory();
+    }
     return step;
 }
 

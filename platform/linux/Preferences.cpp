@@ -15,6 +15,7 @@
 #include "platform/PreferenceChanges.h"
 #include "platform/PropertyListXml.h"
 #include "platform/UserDatabase.h"
+#include "platform/linux/FreedMemory.h"
 #include "platform/linux/PlatformLog.h"
 #include "platform/linux/PreferenceFile.h"
 #include "platform/linux/UserRights.h"
@@ -105,10 +106,12 @@ public:
         if (!IsDomainName(domain)) {
             return false;  // who set something there was told
         }
-        const bool isWritten = synchronizeDomain(domain, complaints);
-        return search == Search::kDomain
-                   ? isWritten
-                   : synchronizeDomain(kGlobalDomain, complaints) && isWritten;
+        bool isWritten = synchronizeDomain(domain, complaints);
+        if (search == Search::kApplication) {
+            isWritten = synchronizeDomain(kGlobalDomain, complaints) && isWritten;
+        }
+        returnMemoryOfLargeFile();
+        return isWritten;
     }
 
     std::optional<PropertyList> copy(std::string_view key, std::string_view domain, Search search) {
@@ -127,13 +130,14 @@ public:
                                              {userFolder(*home), kGlobalDomain, true},
                                              {std::string(kSystemFolder), domain, false},
                                              {std::string(kSystemFolder), kGlobalDomain, false}}};
-        for (const Source& source :
-             std::span(sources).first(search == Search::kDomain ? 1 : sources.size())) {
-            if (auto value = copyFrom(source, key, complaints); value) {
-                return value;
-            }
+        std::optional<PropertyList> value;
+        const auto searched =
+            std::span(sources).first(search == Search::kDomain ? 1 : sources.size());
+        for (auto source = searched.begin(); !value && source != searched.end(); ++source) {
+            value = copyFrom(*source, key, complaints);
         }
-        return std::nullopt;
+        returnMemoryOfLargeFile();
+        return value;
     }
 
     void flush(std::optional<std::string_view> domain) {
@@ -159,6 +163,14 @@ private:
 
     static std::string userFolder(const std::string& home) {
         return home + "/Library/Preferences/";
+    }
+
+    void noteSize(std::size_t fileSize) { hasReadLargeFile_ |= fileSize > kLargestCachedFile; }
+
+    void returnMemoryOfLargeFile() {
+        if (std::exchange(hasReadLargeFile_, false)) {
+            ReturnFreedMemory();
+        }
     }
 
     /// Lets one more change wait: should much wait already, it is written.
@@ -191,9 +203,7 @@ private:
         return write(domain, changes, complaints);
     }
 
-    static bool write(std::string_view domain,
-                      const PreferenceChanges& changes,
-                      Complaints& complaints) {
+    bool write(std::string_view domain, const PreferenceChanges& changes, Complaints& complaints) {
         const auto home = CopyHomeDirectoryForUser(kUserName);
         const UserRights rights(kUserName);
         if (!home || !rights.areHeld()) {
@@ -203,6 +213,7 @@ private:
         const std::string path = Source{userFolder(*home), domain, true}.path();
         const PreferenceFile file(path);
         PreferenceFile::Contents contents = file.read();
+        noteSize(contents.fileSize);
         if (contents.state == PreferenceFile::State::kUnreadable) {
             complaints.add(path, contents.complaint + ", so it is not written over");
             return false;
@@ -242,6 +253,7 @@ private:
             return cached->entries;
         }
         const PreferenceFile::Contents contents = PreferenceFile(path).read();
+        noteSize(contents.fileSize);
         if (!contents.complaint.empty()) {
             complaints.add(path, contents.complaint);
         }
@@ -258,6 +270,7 @@ private:
     // All of it under the mutex, the reading and writing of files as well: two threads that change
     // one domain must not overwrite each other's changes.
     std::mutex mutex_;
+    bool hasReadLargeFile_ = false;
     std::vector<CachedFile> cache_;  ///< the oldest first
     std::map<std::string, PreferenceChanges, std::less<>> waiting_;
 };

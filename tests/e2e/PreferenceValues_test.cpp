@@ -93,10 +93,12 @@ protected:
     }
 
     /// Peak of the daemon's memory so far, in MiB.
-    [[nodiscard]] std::size_t peakMemory() const {
+    [[nodiscard]] std::size_t peakMemory() const { return memory("VmHWM:"); }
+
+    [[nodiscard]] std::size_t memory(const std::string& name) const {
         std::ifstream status("/proc/" + std::to_string(daemon_.pid()) + "/status");
         for (std::string word; status >> word;) {
-            if (word == "VmHWM:") {
+            if (word == name) {
                 std::size_t kib = 0;
                 status >> kib;
                 return kib >> 10;
@@ -384,6 +386,7 @@ TEST_F(PreferenceValues, OfHostileListsCostLittleMemory) {
         ++number;
     }
     EXPECT_EQ(copy("old").data, Xml(PropertyList("old")));
+    EXPECT_LT(memory("RssAnon:"), 4U) << "and nothing of it stays";
     EXPECT_TRUE(daemon_.isRunning());
 }
 
