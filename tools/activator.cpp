@@ -24,36 +24,16 @@
 #include <string_view>
 #include <utility>
 
+#include "client/Descriptor.h"
+
 namespace {
+
+using linefold_client::Descriptor;
 
 constexpr int kPauseMsMin = 50;
 constexpr int kPauseMsMax = 1000;
 constexpr auto kBriefRun = std::chrono::milliseconds(20);
 constexpr int kFirstPassedDescriptor = 3;
-
-class Descriptor final {
-public:
-    explicit Descriptor(int number) : number_(number) {}
-
-    Descriptor(Descriptor&& other) noexcept : number_(std::exchange(other.number_, -1)) {}
-
-    Descriptor(const Descriptor&) = delete;
-    Descriptor& operator=(const Descriptor&) = delete;
-    Descriptor& operator=(Descriptor&&) = delete;
-
-    ~Descriptor() {
-        if (number_ >= 0) {
-            close(number_);
-        }
-    }
-
-    [[nodiscard]] int get() const { return number_; }
-
-    [[nodiscard]] bool isOpen() const { return number_ >= 0; }
-
-private:
-    int number_;
-};
 
 struct Options {
     bool verbose = false;

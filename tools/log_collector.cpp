@@ -22,7 +22,11 @@
 #include <string_view>
 #include <utility>
 
+#include "client/Descriptor.h"
+
 namespace {
+
+using linefold_client::Descriptor;
 
 constexpr const char* kSyslogSocket = "/dev/log";
 constexpr const char* kJournalSocket = "/run/systemd/journal/socket";
@@ -33,34 +37,6 @@ constexpr const char* kJournalFile = "/run/log/journal";
 // Room for the descriptors that one datagram can bring, 253 of them.
 constexpr std::size_t kControlBytes = 2048;
 constexpr std::size_t kMemoryFileBytesMax = 16UL * 1024 * 1024;
-
-class Descriptor final {
-public:
-    explicit Descriptor(int number = -1) : number_(number) {}
-
-    Descriptor(Descriptor&& other) noexcept : number_(std::exchange(other.number_, -1)) {}
-
-    Descriptor(const Descriptor&) = delete;
-    Descriptor& operator=(const Descriptor&) = delete;
-
-    Descriptor& operator=(Descriptor&& other) noexcept {
-        std::swap(number_, other.number_);
-        return *this;
-    }
-
-    ~Descriptor() {
-        if (number_ >= 0) {
-            close(number_);
-        }
-    }
-
-    [[nodiscard]] int get() const { return number_; }
-
-    [[nodiscard]] bool isOpen() const { return number_ >= 0; }
-
-private:
-    int number_;
-};
 
 // The text on one line, so that the bytes that were sent can be told from it again.
 std::string Escaped(std::string_view text) {

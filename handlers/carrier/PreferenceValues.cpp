@@ -19,9 +19,16 @@ bool AreTexts(const String256& domain, const String256& key) {
     return platform::IsUtf8(domain.view()) && platform::IsUtf8(key.view());
 }
 
-/// The value as the bytes of a reply; the log tells the two copying routines apart by number. The
-/// value goes before the memory for the bytes comes, since each may be large.
-kern_return_t SendValue(std::optional<PropertyList> value, int copier, OutOfLineData& reply) {
+/// What the two copying routines differ in; the log tells them apart by number.
+struct Copier {
+    bool (*synchronize)(std::string_view domain);
+    std::optional<PropertyList> (*copy)(std::string_view key, std::string_view domain);
+    int logNumber;
+};
+
+/// The value as the bytes of a reply. The value goes before the memory for the bytes comes, since
+/// each may be large.
+kern_return_t SendValue(std::optional<PropertyList> value, int logNumber, OutOfLineData& reply) {
     if (!value) {
         return platform::KERN_SUCCESS;  // the empty reply: absence is no error
     }
@@ -36,13 +43,26 @@ kern_return_t SendValue(std::optional<PropertyList> value, int copier, OutOfLine
     SystemLog(SystemLogPriority::kError,
               "VM_ALLOCATE %ul (mhs%d)\n",
               static_cast<unsigned>(bytes->size()),
-              copier);
+              logNumber);
     if (code != platform::KERN_SUCCESS) {
         return code;
     }
     std::memcpy(region, bytes->data(), bytes->size());
     reply = {.address = region, .count = static_cast<std::uint32_t>(bytes->size())};
     return platform::KERN_SUCCESS;
+}
+
+kern_return_t CopyValue(const Copier& copier,
+                        const String256& domain,
+                        const String256& key,
+                        OutOfLineData& reply) {
+    reply = {};
+    if (!AreTexts(domain, key)) {
+        return platform::KERN_FAILURE;
+    }
+    // First, so that what other processes wrote is seen.
+    (void)copier.synchronize(domain.view());
+    return SendValue(copier.copy(key.view(), domain.view()), copier.logNumber, reply);
 }
 
 }  // namespace
@@ -72,23 +92,22 @@ kern_return_t server_LFMobileHelperCopyPreferenceValue(mach_port_t /*port*/,
                                                        String256& domain,
                                                        String256& key,
                                                        OutOfLineData& value) {
-    value = {};
-    if (!AreTexts(domain, key)) {
-        return platform::KERN_FAILURE;
-    }
-    // First, so that what other processes wrote is seen.
-    (void)platform::PreferencesSynchronize(domain.view());
-    return SendValue(platform::PreferencesCopyValue(key.view(), domain.view()), 1, value);
+    return CopyValue({.synchronize = platform::PreferencesSynchronize,
+                      .copy = platform::PreferencesCopyValue,
+                      .logNumber = 1},
+                     domain,
+                     key,
+                     value);
 }
 
 kern_return_t server_LFMobileHelperCopyAppPreferenceValue(mach_port_t /*port*/,
                                                           String256& domain,
                                                           String256& key,
                                                           OutOfLineData& value) {
-    value = {};
-    if (!AreTexts(domain, key)) {
-        return platform::KERN_FAILURE;
-    }
-    (void)platform::PreferencesAppSynchronize(domain.view());
-    return SendValue(platform::PreferencesCopyAppValue(key.view(), domain.view()), 2, value);
+    return CopyValue({.synchronize = platform::PreferencesAppSynchronize,
+                      .copy = platform::PreferencesCopyAppValue,
+                      .logNumber = 2},
+                     domain,
+                     key,
+                     value);
 }

@@ -4,16 +4,7 @@ set -u
 
 activator=$LINEFOLD_BUILD/bin/activator
 socket=/run/linefold/test
-failures=0
-
-fail() {
-    echo "FAILED: $1" >&2
-    failures=$((failures + 1))
-}
-
-expect() { # WHAT EXPECTED FOUND
-    [ "$2" = "$3" ] || fail "$1: expected '$2', found '$3'"
-}
+. "$(dirname "$0")/../support/expect.sh"
 
 eventually() {
     for _ in {1..200}; do

@@ -6,16 +6,7 @@ set -u
 tools=$(cd "$(dirname "$0")/../../tools" && pwd)
 folder=$(mktemp -d)
 trap 'rm -rf "$folder"' EXIT
-failures=0
-
-fail() {
-    echo "FAILED: $1"
-    failures=$((failures + 1))
-}
-
-expect() { # WHAT EXPECTED FOUND
-    [ "$2" = "$3" ] || fail "$1: expected '$2', found '$3'"
-}
+. "$(dirname "$0")/../support/expect.sh"
 
 sandbox() {
     "$tools/sandbox" "$@"

@@ -3,15 +3,7 @@
 # nothing of the machine can be written, and all that the phone has is there.
 set -u
 
-failures=0
-fail() {
-    echo "FAILED: $1"
-    failures=$((failures + 1))
-}
-
-expect() { # WHAT EXPECTED FOUND
-    [ "$2" = "$3" ] || fail "$1: expected '$2', found '$3'"
-}
+. "$(dirname "$0")/../support/expect.sh"
 
 # An entry is sent when its sender returns, and kept a little later.
 eventually() {

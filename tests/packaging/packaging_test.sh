@@ -5,12 +5,7 @@ set -eu
 build=$1
 root=$(mktemp -d)
 trap 'rm -rf "$root"' EXIT
-failures=0
-
-fail() {
-    echo "FAILED: $1"
-    failures=$((failures + 1))
-}
+. "$(dirname "$0")/../support/expect.sh"
 
 DESTDIR=$root cmake --install "$build" >"$root/install.log" || { cat "$root/install.log"; exit 1; }
 prefix=$root/usr/local
