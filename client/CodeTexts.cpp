@@ -16,7 +16,7 @@ struct CodeText {
 constexpr std::array<CodeText, 22> kCodeTexts{{
     {LF_MOBILE_HELPER_SUCCESS,                 "SUCCESS",                 "success"},
     {LF_MOBILE_HELPER_NO_SPACE,                "NO_SPACE",                "the service has no memory for its answer"},
-    {LF_MOBILE_HELPER_FAILURE,                 "FAILURE",                 "the operation failed, or an argument is not UTF-8"},
+    {LF_MOBILE_HELPER_FAILURE,                 "FAILURE",                 "the operation failed, or an argument is not UTF-8 or no property list"},
     {LF_MOBILE_HELPER_RESOURCE_SHORTAGE,       "RESOURCE_SHORTAGE",       "the service is at a limit of memory, descriptors or size"},
     {LF_MOBILE_HELPER_NO_ACCESS,               "NO_ACCESS",               "the path is not one that the service may change"},
     {LF_MOBILE_HELPER_NO_DATA,                 "NO_DATA",                 "the property-list file is missing or holds no dictionary"},

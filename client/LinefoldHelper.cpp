@@ -290,6 +290,14 @@ int32_t LFMobileHelperSetPreferenceValue(LFMobileHelper* helper,
     return Call<Row("SetPreferenceValue")>(helper, NoValue{}, domain, key, data);
 }
 
+int32_t LFMobileHelperRemovePreferenceValue(LFMobileHelper* helper,
+                                            const char* domain,
+                                            const char* key) {
+    // The protocol has no routine of its own for it: one byte, whichever, stands for no value.
+    constexpr std::byte kNoValue{};
+    return LFMobileHelperSetPreferenceValue(helper, domain, key, &kNoValue, sizeof kNoValue);
+}
+
 int32_t LFMobileHelperCopyPreferenceValue(
     LFMobileHelper* helper, const char* domain, const char* key, void** value, size_t* valueSize) {
     return Call<Row("CopyPreferenceValue")>(helper, Bulk{value, valueSize}, domain, key);

@@ -8,6 +8,7 @@
 #include <ctime>
 #include <future>
 #include <memory>
+#include <set>
 
 #include "client/FakeService_test.h"
 #include "client/linefold_helper.h"
@@ -124,6 +125,11 @@ std::vector<Routine> AllRoutines() {
                         {36, {0, 1, 0, 1}}, {40, ValueBytes<std::uint32_t>(3)}, {44, ndr},
                         {52, TextBytes("domain")}, {308, TextBytes("key")},
                         {564, ValueBytes<std::uint32_t>(3)}, {568, {7, 8, 9}}}, SimpleReply(8683555, 0)},
+        {"RemovePreferenceValue", [](LF h) { return LFMobileHelperRemovePreferenceValue(h, "domain", "key"); },
+         8683555, 568, {{0, ValueBytes<std::uint32_t>(0x80000000)}, {24, ValueBytes<std::uint32_t>(1)},
+                        {36, {0, 1, 0, 1}}, {40, ValueBytes<std::uint32_t>(1)}, {44, ndr},
+                        {52, TextBytes("domain")}, {308, TextBytes("key")},
+                        {564, ValueBytes<std::uint32_t>(1)}, {568, {0}}}, SimpleReply(8683555, 0)},
         {"CopyPreferenceValue", [](LF h) { return LFMobileHelperCopyPreferenceValue(h, "domain", "key", &data, &size); },
          8683556, 544, {{24, ndr}, {32, TextBytes("domain")}, {288, TextBytes("key")}}, BulkReply(8683556, 0)},
         {"CopyAppPreferenceValue", [](LF h) { return LFMobileHelperCopyAppPreferenceValue(h, "domain", "key", &data, &size); },
@@ -229,7 +235,11 @@ std::string NameOfRoutine(const testing::TestParamInfo<Routine>& info) {
 INSTANTIATE_TEST_SUITE_P(Routines, EveryRoutine, testing::ValuesIn(AllRoutines()), NameOfRoutine);
 
 TEST(EveryRoutineTable, HasAllOfThem) {
-    EXPECT_EQ(AllRoutines().size(), 24U);
+    std::set<std::int32_t> ids;
+    for (const Routine& routine : AllRoutines()) {
+        ids.insert(routine.id);
+    }
+    EXPECT_EQ(ids.size(), 24U) << "removal of a preference shares the routine that sets one";
 }
 
 // ---- The check-in ------------------------------------------------------------------------------

@@ -71,7 +71,7 @@ enum LFMobileHelperCode {
     LF_MOBILE_HELPER_SUCCESS = 0,
     /* The service found no memory for its answer, or the answer is larger than 64 MiB. */
     LF_MOBILE_HELPER_NO_SPACE = 3,
-    /* The operation failed, or an argument is not UTF-8 where it must be. */
+    /* The operation failed, or an argument is not UTF-8 or no property list where it must be. */
     LF_MOBILE_HELPER_FAILURE = 5,
     /* The service has no descriptor or memory left, or the value is larger than 16 MiB. */
     LF_MOBILE_HELPER_RESOURCE_SHORTAGE = 6,
@@ -179,24 +179,36 @@ LF_MOBILE_HELPER_EXPORT int32_t LFMobileHelperIsVoicemailSubscribed(LFMobileHelp
 
 /* ---- Preferences of the mobile user: domain and key of at most 256 bytes -------------------- */
 
-/* Stores a value, given as a serialised property list of at most LF_MOBILE_HELPER_MAX_VALUE_SIZE
- * bytes. A value of exactly one byte, whatever the byte, removes the key.
- * FAILURE: the value is not a property list, or domain or key is not UTF-8.
- * ERROR_ARGUMENT_TOO_LONG: the value is too large. The data stays the caller's. */
+/* Stores a value, given as a serialised property list, XML or binary, of at most
+ * LF_MOBILE_HELPER_MAX_VALUE_SIZE bytes. The data stays the caller's, who may free it afterwards.
+ * Mind the size: data of exactly one byte, whatever the byte, is no value but removes the key. No
+ * property list is that short; LFMobileHelperRemovePreferenceValue says it by name.
+ * The result is 0 also when the service could not write the file of the domain, or the domain
+ * cannot name a file (it is empty, has a "/", or more than 249 bytes): its log tells.
+ * FAILURE: the value is not a property list (an empty one is none), or domain or key is not UTF-8.
+ * ERROR_ARGUMENT_TOO_LONG: the value is too large. */
 LF_MOBILE_HELPER_EXPORT int32_t LFMobileHelperSetPreferenceValue(LFMobileHelper* helper,
                                                                  const char* domain,
                                                                  const char* key,
                                                                  const void* value,
                                                                  size_t valueSize);
 
-/* Reads a value as an XML property list. The caller frees *value with LFMobileHelperFree. A key
- * without a value is a success with *value NULL and *valueSize 0; a value is never NULL.
+/* Removes the value of a key; a key without one is a success too. The result is 0 also when the
+ * file could not be written, as above. FAILURE: domain or key is not UTF-8. */
+LF_MOBILE_HELPER_EXPORT int32_t LFMobileHelperRemovePreferenceValue(LFMobileHelper* helper,
+                                                                    const char* domain,
+                                                                    const char* key);
+
+/* Reads a value as an XML property list of *valueSize bytes, without a NUL behind them. *value is
+ * the caller's, who frees it with LFMobileHelperFree. A key without a value is a success with
+ * *value NULL and *valueSize 0; a value is never NULL.
  * FAILURE: domain or key is not UTF-8, or the value cannot be written as XML. NO_SPACE. */
 LF_MOBILE_HELPER_EXPORT int32_t LFMobileHelperCopyPreferenceValue(
     LFMobileHelper* helper, const char* domain, const char* key, void** value, size_t* valueSize);
 
-/* The same, with the search list of an application: also the domains for all applications and all
- * users are asked. */
+/* The same, with the search list of an application. The first of these that has the key gives the
+ * value: the domain, the mobile user's domain for all applications (".GlobalPreferences"), and the
+ * same two of all users in /Library/Preferences. */
 LF_MOBILE_HELPER_EXPORT int32_t LFMobileHelperCopyAppPreferenceValue(
     LFMobileHelper* helper, const char* domain, const char* key, void** value, size_t* valueSize);
 
