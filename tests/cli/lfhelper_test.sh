@@ -43,15 +43,19 @@ expect 0 --help
 says out 'Usage: lfhelper'
 says out 'Examples:'
 silent err
-for command in check-in link-carrier-bundle create-symlink remove-preference-domain raw; do
+for command in check-in link-carrier-bundle create-symlink remove-preference-domain \
+    'preferences get' 'preferences set' 'preferences remove' raw; do
+    expect 0 --help
     says out "  $command "
-done
-for command in check-in link-carrier-bundle create-symlink remove-preference-domain raw; do
-    expect 0 "$command" --help
+    # shellcheck disable=SC2086 # a command of two words is two arguments
+    expect 0 $command --help
     says out "Usage: lfhelper [OPTIONS] $command"
     says out 'Examples:'
     silent err
 done
+expect 0 preferences --help
+says out '  preferences get '
+silent err
 expect 0 --version
 says out 'lfhelper '
 silent err
@@ -88,6 +92,45 @@ usage 'HEX must be pairs of hexadecimal digits' raw 1 0
 usage 'HEX must be pairs of hexadecimal digits' raw 1 0g
 usage 'the value of --claim-size must be' raw --claim-size=-1 1
 usage 'the option --complex belongs to the command raw' --complex check-in
+usage 'preferences is not the whole command' preferences
+says err 'Try: lfhelper preferences --help'
+usage 'there is no command preferences nonsense' preferences nonsense
+usage 'too few arguments for preferences get' preferences get domain
+usage 'too many arguments for preferences get' preferences get domain key value
+usage 'too few arguments for preferences set' preferences set domain key
+usage 'too many arguments for preferences set' preferences set domain key two words
+usage 'too few arguments for preferences remove' preferences remove domain
+usage 'too many arguments for preferences remove' preferences remove domain key value
+usage 'the option --type belongs to the command preferences set' preferences get --type plist d k
+usage 'the option --plist belongs to the command preferences get' preferences set --plist d k v
+usage 'the value of --type must be one of string, integer, real,' preferences set --type text d k v
+
+# ---- Values that are not of their type
+misfit() {
+    type=$1
+    shift
+    for value; do
+        usage 'VALUE is not ' preferences set --type "$type" d k -- "$value"
+        says err 'Try: lfhelper preferences set --help'
+    done
+}
+misfit string "$(printf 'a\001')" "$(printf '\377')"
+misfit integer abc '' 12abc 1.5 9223372036854775808 --5 '<integer>5</integer>'
+misfit real abc '' 1,5 1e999 -
+misfit boolean '' yes TRUE 1
+misfit date '' tomorrow 2023-02-29T00:00:00Z '2001-01-01 00:00:00'
+misfit data 0g Y 'YQ=' '!' --
+misfit plist x
+
+# ---- Standard input: nothing to read, too much of it
+what='lfhelper preferences set d k - <&-'
+timeout 30 "$lfhelper" preferences set d k - >"$folder/out" 2>"$folder/err" <&-
+[ $? -eq 2 ] || fail "$what: not wrong usage"
+says err 'standard input cannot be read: '
+what='lfhelper preferences set d k - </dev/zero'
+timeout 30 "$lfhelper" preferences set d k - >"$folder/out" 2>"$folder/err" </dev/zero
+[ $? -eq 2 ] || fail "$what: not wrong usage"
+says err 'standard input holds more than 16777216 bytes'
 
 # ---- Wrong usage, for programs
 expect 2 --json nonsense

@@ -48,6 +48,9 @@ const std::vector<Rule> kRules{
       "Helper/Shared/Server/MessageLayouts.h",
       "platform/MachMessage.h",
       "platform/MachPort.h",
+      "platform/PropertyList.h",
+      "platform/PropertyListLimits.h",
+      "platform/PropertyListText.h",
       "platform/BuildConstants.h"},
      {"*"}},
 };

@@ -15,7 +15,7 @@ struct KnownOption {
     std::string_view command;
 };
 
-constexpr std::array<KnownOption, 7> kKnownOptions{{
+constexpr std::array<KnownOption, 10> kKnownOptions{{
     {"help", Takes::kNothing, ""},
     {"version", Takes::kNothing, ""},
     {"json", Takes::kNothing, ""},
@@ -23,7 +23,13 @@ constexpr std::array<KnownOption, 7> kKnownOptions{{
     {"service", Takes::kValue, ""},
     {"complex", Takes::kNothing, "raw"},
     {"claim-size", Takes::kValue, "raw"},
+    {"application", Takes::kNothing, "preferences get"},
+    {"plist", Takes::kNothing, "preferences get"},
+    {"type", Takes::kValue, "preferences set"},
 }};
+
+/// The first word of commands that have two.
+constexpr std::string_view kCommandGroup = "preferences";
 
 const KnownOption* FindKnownOption(std::string_view name) {
     const auto found = std::ranges::find(kKnownOptions, name, &KnownOption::name);
@@ -73,6 +79,8 @@ private:
         if (!hasCommand_) {
             hasCommand_ = true;
             line_.command = argument;
+        } else if (line_.command == kCommandGroup) {
+            line_.command.append(" ").append(argument);
         } else {
             line_.operands.emplace_back(argument);
         }

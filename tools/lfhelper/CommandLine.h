@@ -15,7 +15,7 @@ struct CommandLine {
         std::string value;
     };
 
-    /// Empty when there is none.
+    /// Empty when there is none; of "preferences", the word behind it belongs to the command.
     std::string command;
     std::vector<std::string> operands;
     std::vector<Option> options;

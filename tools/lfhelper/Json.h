@@ -19,6 +19,9 @@ public:
 
     void add(std::string_view key, const JsonObject& object) { addRaw(key, object.toString()); }
 
+    /// A number or a boolean that is spelled as JSON spells it.
+    void addLiteral(std::string_view key, std::string_view literal) { addRaw(key, literal); }
+
     void addNull(std::string_view key) { addRaw(key, "null"); }
 
     /// Puts the members of another object behind these.

@@ -11,6 +11,7 @@
 
 #include "Helper/Shared/Server/MessageLayouts.h"
 #include "tools/lfhelper/HexDump.h"
+#include "tools/lfhelper/PreferenceCommands.h"
 
 namespace lfhelper {
 namespace {
@@ -136,7 +137,7 @@ Preparation PrepareRaw(const CommandLine& line) {
     return {.request = [message](LFMobileHelper* helper) { return SendAndDump(helper, message); }};
 }
 
-constexpr std::array<Subcommand, 5> kSubcommands{{
+constexpr std::array<Subcommand, 8> kSubcommands{{
     {"check-in",
      "",
      "ask whether the service is there and takes this caller",
@@ -182,6 +183,64 @@ constexpr std::array<Subcommand, 5> kSubcommands{{
      1,
      2,
      PrepareRemovePreferenceDomain},
+    {"preferences get",
+     "[--application] [--plist] DOMAIN KEY",
+     "show a preference value of the mobile user",
+     "Shows a text, number or boolean as such and any other value as an XML property list.\n"
+     "\n"
+     "  --application    look where an application does: in DOMAIN, in .GlobalPreferences, and in\n"
+     "                   the same two of /Library/Preferences; the first value found counts\n"
+     "  --plist          show every value as an XML property list\n"
+     "\n"
+     "A key without a value is no failure of the service, nor is it an empty text: nothing is\n"
+     "printed but a note on standard error, and the exit status is 4, so that a script can tell.\n"
+     "With --json, \"type\" tells the kind; \"value\" holds texts, booleans and finite numbers "
+     "and\n"
+     "is null when there is no value; anything else stands as an XML property list in \"plist\".\n"
+     "A list of more than 16 MiB is shown as it is, with the type \"plist\".\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper preferences get com.vendra.carrier_2 CarrierName\n"
+     "  lfhelper preferences get --application --json com.vendra.carrier_2 CarrierName\n",
+     2,
+     2,
+     PreparePreferencesGet},
+    {"preferences set",
+     "[--type TYPE] DOMAIN KEY VALUE",
+     "store a preference value of the mobile user",
+     "Stores VALUE, or what standard input holds when VALUE is -, at most 16 MiB.\n"
+     "\n"
+     "  --type TYPE    what VALUE is:\n"
+     "      string     a text in UTF-8 (the default)\n"
+     "      integer    a decimal number of 64 bits, or a hexadecimal one behind 0x\n"
+     "      real       a decimal number, inf or nan\n"
+     "      boolean    true or false\n"
+     "      date       such as 2001-01-01T00:00:00Z\n"
+     "      data       bytes in base64, as the program base64 writes them\n"
+     "      plist      a property list of any kind, XML or binary, sent as it is\n"
+     "\n"
+     "One line feed at the end of standard input is not part of the value, but for a plist. A\n"
+     "VALUE that begins with - and is neither - nor a number goes behind --. The service answers\n"
+     "success before anybody can know that the disk took the value: its log tells otherwise.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper preferences set com.vendra.carrier_2 CarrierName 'Example Mobile'\n"
+     "  lfhelper preferences set --type integer com.vendra.carrier_2 SignalBars -4\n"
+     "  base64 icon.png | lfhelper preferences set --type data com.vendra.carrier_2 Icon -\n"
+     "  lfhelper preferences set --type plist com.vendra.carrier_2 Apns - <apns.plist\n",
+     3,
+     3,
+     PreparePreferencesSet},
+    {"preferences remove",
+     "DOMAIN KEY",
+     "remove a preference value of the mobile user",
+     "Removes the value of KEY; that there is none is a success too.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper preferences remove com.vendra.carrier_2 CarrierName\n",
+     2,
+     2,
+     PreparePreferencesRemove},
     {"raw",
      "[--complex] [--claim-size N] ID [HEX]",
      "send a message as it is, and show the reply field by field",

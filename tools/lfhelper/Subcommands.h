@@ -20,6 +20,8 @@ struct Answer {
     std::string text{};
     /// For programs, beside the code.
     JsonObject fields{};
+    /// For people, when the service found nothing where it was asked to look; else empty.
+    std::string absence{};
 };
 
 using Request = std::function<Answer(LFMobileHelper* helper)>;

@@ -17,10 +17,12 @@ struct Outcome {
     std::string output;
 };
 
-Outcome RunProgram(const Service& service, const std::string& arguments) {
+Outcome RunProgram(const Service& service,
+                   const std::string& arguments,
+                   const std::string& input = "</dev/null") {
     const std::string command = std::string(LFHELPER_PROGRAM) +
                                 " --group \"$(id -gn)\" --service " + service.path() + " " +
-                                arguments + " 2>&1 </dev/null";
+                                arguments + " 2>&1 " + input;
     Outcome outcome;
     std::FILE* const pipe = popen(command.c_str(), "re");
     std::array<char, 4096> chunk{};
@@ -33,6 +35,11 @@ Outcome RunProgram(const Service& service, const std::string& arguments) {
     return outcome;
 }
 
+std::string List(const std::string& element) {
+    return "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n<plist version=\"1.0\">\n" + element +
+           "\n</plist>\n";
+}
+
 bool Contains(const std::string& text, const std::string& part) {
     return text.find(part) != std::string::npos;
 }
@@ -42,15 +49,35 @@ protected:
     /// Answers one request of one client.
     Outcome runAnswered(const std::string& arguments,
                         const Bytes& reply,
-                        const std::vector<int>& descriptors = {}) {
+                        const std::vector<int>& descriptors = {},
+                        const std::string& input = "</dev/null") {
         service.play([this, reply, descriptors](Service& self) {
             const Session session = self.checkIn();
             request = Receive(session.port.get()).bytes;
             Send(session.port.get(), reply, descriptors);
         });
-        auto outcome = RunProgram(service, arguments);
+        auto outcome = RunProgram(service, arguments, input);
         service.finish();
         return outcome;
+    }
+
+    /// What the service was asked to store; the value must lie behind the request.
+    std::string valueSetBy(const std::string& arguments, const std::string& input = "</dev/null") {
+        const auto outcome =
+            runAnswered("preferences set " + arguments, SimpleReply(8683555, 0), {}, input);
+        EXPECT_EQ(outcome.exitStatus, 0);
+        EXPECT_EQ(outcome.output, "preferences set: success\n");
+        EXPECT_EQ(Get<std::int32_t>(request, 20), 8683555);
+        EXPECT_EQ(Get<std::uint32_t>(request, 40) + 568, request.size());
+        return std::string(request.begin() + 568, request.end());
+    }
+
+    /// Answers the request for a value.
+    Outcome runShowing(const std::string& arguments, const std::string& value) {
+        return runAnswered("preferences get " + arguments,
+                           BulkReply(8683556,
+                                     static_cast<std::uint32_t>(value.size()),
+                                     Bytes(value.begin(), value.end())));
     }
 
     [[nodiscard]] std::string requestText(std::size_t offset) const {
@@ -108,7 +135,8 @@ TEST_F(LfhelperTest, CreatesASymbolicLink) {
     EXPECT_EQ(requestText(32) + requestText(1056), "targetlink");
     EXPECT_EQ(outcome.output,
               "{\"command\":\"create-symlink\",\"exitStatus\":1,\"code\":5,\"name\":\"FAILURE\","
-              "\"meaning\":\"the operation failed, or an argument is not UTF-8\","
+              "\"meaning\":\"the operation failed, or an argument is not UTF-8 or no property "
+              "list\","
               "\"target\":\"target\",\"link\":\"link\"}\n");
 }
 
@@ -118,6 +146,159 @@ TEST_F(LfhelperTest, RemovesAPreferenceDomain) {
     EXPECT_EQ(outcome.exitStatus, 0);
     EXPECT_EQ(Get<std::int32_t>(request, 20), 8683560);
     EXPECT_EQ(requestText(32) + requestText(1056), "pathdomain");
+}
+
+struct SetCase {
+    const char* name;
+    const char* arguments;
+    const char* element;
+};
+
+class LfhelperSets : public LfhelperTest, public testing::WithParamInterface<SetCase> {};
+
+TEST_P(LfhelperSets, AValueAsAPropertyList) {
+    EXPECT_EQ(valueSetBy(GetParam().arguments), List(GetParam().element));
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Types,
+    LfhelperSets,
+    testing::Values(
+        SetCase{"Text", "d k 'a<b ü'", "<string>a&lt;b ü</string>"},
+        SetCase{"EmptyText", "--type string d k ''", "<string></string>"},
+        SetCase{"Integer", "d k -5 --type=integer", "<integer>-5</integer>"},
+        SetCase{"HexadecimalInteger", "--type integer d k 0x10", "<integer>16</integer>"},
+        SetCase{"Real", "--type real d k 0.50", "<real>0.5</real>"},
+        SetCase{"EndlessReal", "--type real d k -- -inf", "<real>-infinity</real>"},
+        SetCase{"True", "--type boolean d k true", "<true/>"},
+        SetCase{"False", "--type boolean d k false", "<false/>"},
+        SetCase{
+            "Date", "--type date d k 2024-02-29T23:59:59Z", "<date>2024-02-29T23:59:59Z</date>"},
+        SetCase{"Data", "--type data d k AP8=", "<data>AP8=</data>"}),
+    [](const auto& test) { return std::string(test.param.name); });
+
+struct ShowCase {
+    const char* name;
+    const char* element;
+    const char* shown;
+    const char* fields;  ///< at the end of the JSON object
+};
+
+class LfhelperShows : public LfhelperTest, public testing::WithParamInterface<ShowCase> {};
+
+TEST_P(LfhelperShows, AValueAsSuch) {
+    const auto outcome = runShowing("d k", List(GetParam().element));
+    EXPECT_EQ(outcome.exitStatus, 0);
+    EXPECT_EQ(outcome.output, GetParam().shown);
+}
+
+TEST_P(LfhelperShows, AValueInJson) {
+    const auto outcome = runShowing("--json d k", List(GetParam().element));
+    EXPECT_EQ(outcome.exitStatus, 0);
+    EXPECT_TRUE(outcome.output.ends_with("\"domain\":\"d\",\"key\":\"k\"," +
+                                         std::string(GetParam().fields) + "}\n"))
+        << outcome.output;
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Types,
+    LfhelperShows,
+    testing::Values(
+        ShowCase{"Text",
+                 "<string>\"&lt;ü\n</string>",
+                 "\"<ü\n\n",
+                 R"("type":"string","value":"\"<ü\u000a")"},
+        ShowCase{"EmptyText", "<string/>", "\n", R"("type":"string","value":"")"},
+        ShowCase{"TextLikeANumber", "<string>5</string>", "5\n", R"("type":"string","value":"5")"},
+        ShowCase{"Integer",
+                 "<integer>-9223372036854775808</integer>",
+                 "-9223372036854775808\n",
+                 R"("type":"integer","value":-9223372036854775808)"},
+        ShowCase{"Real", "<real>0.1</real>", "0.1\n", R"("type":"real","value":0.1)"},
+        ShowCase{"LargeReal", "<real>1e300</real>", "1e+300\n", R"("type":"real","value":1e+300)"},
+        ShowCase{"True", "<true/>", "true\n", R"("type":"boolean","value":true)"},
+        ShowCase{"False", "<false/>", "false\n", R"("type":"boolean","value":false)"}),
+    [](const auto& test) { return std::string(test.param.name); });
+
+TEST_F(LfhelperTest, HasNoJsonNumberForAnEndlessOne) {
+    const auto outcome = runShowing("--json d k", List("<real>-inf</real>"));
+    EXPECT_TRUE(Contains(outcome.output, R"("type":"real","plist":"<?xml )")) << outcome.output;
+    EXPECT_TRUE(Contains(outcome.output, R"(<real>-inf</real>)"));
+}
+
+TEST_F(LfhelperTest, GivesProgramsAPropertyListAsAText) {
+    const auto outcome = runShowing("--json d k", List("<dict/>"));
+    EXPECT_TRUE(Contains(outcome.output, R"("type":"dictionary","plist":"<?xml version=\"1.0\")"))
+        << outcome.output;
+    EXPECT_TRUE(outcome.output.ends_with(R"(<dict/>\u000a</plist>\u000a"})"
+                                         "\n"));
+}
+
+TEST_F(LfhelperTest, NamesTheDomainAndTheKeyOfAPreference) {
+    (void)valueSetBy("com.vendra.test Key value");
+    EXPECT_EQ(requestText(52), "com.vendra.test");
+    EXPECT_EQ(requestText(308), "Key");
+}
+
+TEST_F(LfhelperTest, SetsAPropertyListAsItIs) {
+    EXPECT_EQ(valueSetBy("--type plist d k -", "<<'END'\nnone at all\nEND\n"), "none at all\n");
+}
+
+TEST_F(LfhelperTest, DropsTheLineFeedBehindAValueOnStandardInput) {
+    EXPECT_EQ(valueSetBy("d k -", "<<'END'\ntwo\n\nEND\n"), List("<string>two\n</string>"));
+}
+
+TEST_F(LfhelperTest, RemovesAPreferenceValueByOneByte) {
+    const auto outcome = runAnswered("preferences remove d k", SimpleReply(8683555, 0));
+    EXPECT_EQ(outcome.exitStatus, 0);
+    EXPECT_EQ(outcome.output, "preferences remove: success\n");
+    EXPECT_EQ(Get<std::uint32_t>(request, 564), 1U);
+    EXPECT_EQ(requestText(52) + requestText(308), "dk");
+}
+
+TEST_F(LfhelperTest, AsksForTheValueOfADomain) {
+    (void)runShowing("com.vendra.test Key", List("<true/>"));
+    EXPECT_EQ(Get<std::int32_t>(request, 20), 8683556);
+    EXPECT_EQ(requestText(32) + requestText(288), "com.vendra.testKey");
+}
+
+TEST_F(LfhelperTest, ShowsAnyOtherValueAsAPropertyList) {
+    const std::string list = List("<array>\n\t<true/>\n</array>");
+    EXPECT_EQ(runShowing("d k", list).output, list);
+}
+
+TEST_F(LfhelperTest, ShowsEveryValueAsAPropertyListWhenAsked) {
+    EXPECT_EQ(runShowing("--plist d k", List("<true/>")).output, List("<true/>"));
+}
+
+TEST_F(LfhelperTest, AsksForTheValueOfAnApplication) {
+    const auto outcome = runAnswered("preferences get --application d k", BulkReply(8683557, 0));
+    EXPECT_EQ(Get<std::int32_t>(request, 20), 8683557);
+    EXPECT_EQ(outcome.exitStatus, 4);
+    EXPECT_EQ(outcome.output, "lfhelper: preferences get: there is no value of \"k\" in d\n");
+}
+
+TEST_F(LfhelperTest, TellsProgramsOfAnAbsentValue) {
+    EXPECT_EQ(
+        runShowing("--json d k", "").output,
+        "{\"command\":\"preferences get\",\"exitStatus\":4,\"code\":0,\"name\":\"SUCCESS\","
+        "\"meaning\":\"success\",\"domain\":\"d\",\"key\":\"k\",\"type\":null,\"value\":null}\n");
+}
+
+TEST_F(LfhelperTest, RefusesAValueThatIsNoPropertyList) {
+    const auto outcome = runShowing("d k", "not a list");
+    EXPECT_EQ(outcome.exitStatus, 1);
+    EXPECT_TRUE(Contains(outcome.output, "ERROR_INVALID_REPLY")) << outcome.output;
+}
+
+TEST_F(LfhelperTest, ShowsAListThatIsTooLongToParse) {
+    const std::string list = List("<string>" + std::string(16U << 20, 'x') + "</string>");
+    const Descriptor file = MemoryFile(Bytes(list.begin(), list.end()));
+    const auto outcome = runAnswered("preferences get d k",
+                                     BulkReply(8683556, static_cast<std::uint32_t>(list.size())),
+                                     {file.get()});
+    EXPECT_EQ(outcome.exitStatus, 0);
+    EXPECT_TRUE(outcome.output == list);
 }
 
 TEST_F(LfhelperTest, ShowsARawReplyFieldByField) {

@@ -16,7 +16,7 @@ using namespace lfhelper;
 
 namespace {
 
-enum ExitStatus { kSuccess = 0, kFailure = 1, kUsage = 2, kNotServed = 3 };
+enum ExitStatus { kSuccess = 0, kFailure = 1, kUsage = 2, kNotServed = 3, kNoValue = 4 };
 
 struct DestroyHelper {
     void operator()(LFMobileHelper* helper) const { LFMobileHelperDestroy(helper); }
@@ -34,17 +34,26 @@ void PrintError(std::string_view text) {
     Print(stderr, "\n");
 }
 
+/// A line for each command whose name starts so.
+std::string ListOfCommands(std::string_view start) {
+    std::string text;
+    for (const Subcommand& subcommand : Subcommands()) {
+        if (subcommand.name.starts_with(start)) {
+            std::string name(subcommand.name);
+            name.resize(26, ' ');
+            text += "  " + name + std::string(subcommand.summary) + "\n";
+        }
+    }
+    return text;
+}
+
 void PrintHelp() {
     std::string text =
         "Usage: lfhelper [OPTIONS] COMMAND [ARGUMENTS]\n"
         "Calls the service LinefoldMobileHelper.\n"
         "\n"
-        "Commands:\n";
-    for (const Subcommand& subcommand : Subcommands()) {
-        std::string name(subcommand.name);
-        name.resize(26, ' ');
-        text += "  " + name + std::string(subcommand.summary) + "\n";
-    }
+        "Commands:\n" +
+        ListOfCommands("");
     text +=
         "\n"
         "Options:\n"
@@ -59,11 +68,11 @@ void PrintHelp() {
         "  --version       print the version\n"
         "\n"
         "Exit status: 0 success; 1 the service refused or failed; 2 wrong usage;\n"
-        "3 no service, not entitled, or the group cannot be taken.\n"
+        "3 no service, not entitled, or the group cannot be taken; 4 there is no such value.\n"
         "\n"
         "Examples:\n"
         "  lfhelper check-in\n"
-        "  lfhelper raw --help\n";
+        "  lfhelper preferences set --help\n";
     Print(stdout, text);
 }
 
@@ -74,13 +83,17 @@ void PrintHelpOf(const Subcommand& subcommand) {
               std::string(subcommand.help) + "\nOptions for all commands: lfhelper --help\n");
 }
 
+/// Also for a word that commands start with and that is none itself.
+bool IsKnown(const std::string& command) {
+    return FindSubcommand(command) != nullptr || !ListOfCommands(command + " ").empty();
+}
+
 /// Says in JSON, too, why there was nothing to call.
 int Fail(const CommandLine& line, ExitStatus status, std::string_view name, std::string_view why) {
     PrintError(why);
     if (status == kUsage) {
         Print(stderr,
-              "Try: lfhelper " +
-                  (FindSubcommand(line.command) == nullptr ? "" : line.command + " ") + "--help\n");
+              "Try: lfhelper " + (IsKnown(line.command) ? line.command + " " : "") + "--help\n");
     }
     if (line.has("json")) {
         JsonObject object;
@@ -94,10 +107,10 @@ int Fail(const CommandLine& line, ExitStatus status, std::string_view name, std:
     return status;
 }
 
-ExitStatus ExitStatusOf(std::int32_t code) {
-    switch (code) {
+ExitStatus ExitStatusOf(const Answer& answer) {
+    switch (answer.code) {
         case LF_MOBILE_HELPER_SUCCESS:
-            return kSuccess;
+            return answer.absence.empty() ? kSuccess : kNoValue;
         case LF_MOBILE_HELPER_NOT_ENTITLED:
         case LF_MOBILE_HELPER_ERROR_NO_SERVICE:
         case LF_MOBILE_HELPER_ERROR_NOT_A_SERVICE:
@@ -114,7 +127,7 @@ ExitStatus ExitStatusOf(std::int32_t code) {
 void PrintAnswerForPrograms(const Subcommand& subcommand, const Answer& answer) {
     JsonObject object;
     object.add("command", subcommand.name);
-    object.add("exitStatus", std::int64_t{ExitStatusOf(answer.code)});
+    object.add("exitStatus", std::int64_t{ExitStatusOf(answer)});
     object.add("code", std::int64_t{answer.code});
     object.add("name", LFMobileHelperErrorName(answer.code));
     object.add("meaning", LFMobileHelperErrorString(answer.code));
@@ -126,7 +139,9 @@ void PrintAnswerForPeople(const Subcommand& subcommand, const Answer& answer) {
     Print(stdout, answer.text);
     const std::string name(subcommand.name);
     const std::string meaning = LFMobileHelperErrorString(answer.code);
-    if (answer.code == LF_MOBILE_HELPER_SUCCESS && answer.text.empty()) {
+    if (!answer.absence.empty()) {
+        PrintError(name + ": " + answer.absence);
+    } else if (answer.code == LF_MOBILE_HELPER_SUCCESS && answer.text.empty()) {
         Print(stdout, name + ": " + meaning + "\n");
     } else if (answer.code != LF_MOBILE_HELPER_SUCCESS) {
         PrintError(name + ": " + std::to_string(answer.code) + " " +
@@ -147,7 +162,7 @@ int Call(const CommandLine& line, const Subcommand& subcommand, const Request& r
     } else {
         PrintAnswerForPeople(subcommand, answer);
     }
-    return ExitStatusOf(answer.code);
+    return ExitStatusOf(answer);
 }
 
 int RunSubcommand(const CommandLine& line, const Subcommand& subcommand) {
@@ -162,10 +177,23 @@ int RunSubcommand(const CommandLine& line, const Subcommand& subcommand) {
                                      : Fail(line, kUsage, "USAGE", preparation.error);
 }
 
+/// For a word that commands start with and that is none itself.
+int RunHalfCommand(const CommandLine& line, const std::string& itsCommands) {
+    if (!line.has("help")) {
+        return Fail(line, kUsage, "USAGE", line.command + " is not the whole command");
+    }
+    Print(stdout,
+          "Commands:\n" + itsCommands + "\nTry: lfhelper " + line.command + " WORD --help\n");
+    return kSuccess;
+}
+
 int Run(const CommandLine& line) {
     const Subcommand* const subcommand = FindSubcommand(line.command);
     if (!line.error.empty()) {
         return Fail(line, kUsage, "USAGE", line.error);
+    }
+    if (const auto itsCommands = ListOfCommands(line.command + " "); !itsCommands.empty()) {
+        return RunHalfCommand(line, itsCommands);
     }
     if (subcommand == nullptr && !line.command.empty()) {
         return Fail(line, kUsage, "USAGE", "there is no command " + line.command);

@@ -1,0 +1,120 @@
+#include "tools/lfhelper/PreferenceCommands.h"
+
+#include <memory>
+
+#include "tools/lfhelper/PreferenceValue.h"
+#include "tools/lfhelper/StandardInput.h"
+
+namespace lfhelper {
+namespace {
+
+struct FreeData {
+    void operator()(void* data) const { LFMobileHelperFree(data); }
+};
+
+struct Place {
+    std::string domain;
+    std::string key;
+};
+
+Place PlaceOf(const CommandLine& line) {
+    return {.domain = line.operands[0], .key = line.operands[1]};
+}
+
+JsonObject FieldsOf(const Place& place) {
+    JsonObject fields;
+    fields.add("domain", place.domain);
+    fields.add("key", place.key);
+    return fields;
+}
+
+Answer AnswerOfAbsence(const Place& place) {
+    Answer answer{.fields = FieldsOf(place),
+                  .absence = "there is no value of \"" + place.key + "\" in " + place.domain};
+    answer.fields.addNull("type");
+    answer.fields.addNull("value");
+    return answer;
+}
+
+using CopyValue = decltype(&LFMobileHelperCopyPreferenceValue);
+
+Answer GetValue(LFMobileHelper* helper, CopyValue copyValue, const Place& place, ValueForm form) {
+    void* data = nullptr;
+    std::size_t size = 0;
+    const std::int32_t code =
+        copyValue(helper, place.domain.c_str(), place.key.c_str(), &data, &size);
+    const std::unique_ptr<void, FreeData> owner(data);
+    if (code != LF_MOBILE_HELPER_SUCCESS) {
+        return {.code = code, .fields = FieldsOf(place)};
+    }
+    if (data == nullptr) {
+        return AnswerOfAbsence(place);
+    }
+    auto shown = ShowValue({static_cast<const char*>(data), size}, form);
+    if (!shown) {
+        return {.code = LF_MOBILE_HELPER_ERROR_INVALID_REPLY, .fields = FieldsOf(place)};
+    }
+    Answer answer{.text = std::move(shown->text), .fields = FieldsOf(place)};
+    answer.fields.append(shown->fields);
+    return answer;
+}
+
+struct ValueText {
+    std::string text;
+    std::string error{};
+};
+
+/// The operand, or what standard input holds in its place.
+ValueText ReadValueText(const std::string& operand, ValueType type) {
+    if (operand != "-") {
+        return {.text = operand};
+    }
+    auto input = ReadStandardInput(LF_MOBILE_HELPER_MAX_VALUE_SIZE);
+    // What is typed or echoed ends in a line feed that nobody means, as does what "get" prints.
+    if (type != ValueType::kPlist && input.content.ends_with('\n')) {
+        input.content.pop_back();
+    }
+    return {.text = std::move(input.content), .error = std::move(input.error)};
+}
+
+}  // namespace
+
+Preparation PreparePreferencesGet(const CommandLine& line) {
+    const CopyValue copyValue = line.has("application") ? LFMobileHelperCopyAppPreferenceValue
+                                                        : LFMobileHelperCopyPreferenceValue;
+    const ValueForm form = line.has("plist") ? ValueForm::kPlist : ValueForm::kPlain;
+    return {.request = [copyValue, form, place = PlaceOf(line)](LFMobileHelper* helper) {
+        return GetValue(helper, copyValue, place, form);
+    }};
+}
+
+Preparation PreparePreferencesSet(const CommandLine& line) {
+    const auto type = FindValueType(line.value("type").value_or("string"));
+    if (!type) {
+        return {.error = "the value of --type must be one of " + ValueTypeNames()};
+    }
+    const ValueText value = ReadValueText(line.operands[2], *type);
+    if (!value.error.empty()) {
+        return {.error = value.error};
+    }
+    const SerializedValue serialized = SerializeValue(*type, value.text);
+    if (!serialized.error.empty()) {
+        return {.error = serialized.error};
+    }
+    return {.request = [bytes = serialized.bytes, place = PlaceOf(line)](LFMobileHelper* helper) {
+        return Answer{
+            .code = LFMobileHelperSetPreferenceValue(
+                helper, place.domain.c_str(), place.key.c_str(), bytes.data(), bytes.size()),
+            .fields = FieldsOf(place)};
+    }};
+}
+
+Preparation PreparePreferencesRemove(const CommandLine& line) {
+    return {.request = [place = PlaceOf(line)](LFMobileHelper* helper) {
+        return Answer{.code = LFMobileHelperRemovePreferenceValue(
+                          helper, place.domain.c_str(), place.key.c_str()),
+                      .fields = FieldsOf(place)};
+    }};
+}
+
+}  // namespace lfhelper
