@@ -221,7 +221,7 @@ constexpr std::array<Subcommand, 8> kSubcommands{{
      "\n"
      "One line feed at the end of standard input is not part of the value, but for a plist. A\n"
      "VALUE that begins with - and is neither - nor a number goes behind --. The service answers\n"
-     "success before anybody can know that the disk took the value: its log tells otherwise.\n"
+     "success also when it could not write the file of the domain: its log tells.\n"
      "\n"
      "Examples:\n"
      "  lfhelper preferences set com.vendra.carrier_2 CarrierName 'Example Mobile'\n"
