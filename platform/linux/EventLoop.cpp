@@ -20,9 +20,8 @@ constexpr std::size_t kEventsPerTurn = 64;
 /// Longer waits than this are cut: they come back and wait again.
 constexpr double kLongestWait = 1e6;
 
-/// What epoll hands back: the descriptor, and which of its successive owners is meant.
-std::uint64_t Token(int descriptor, std::uint32_t serial) {
-    return static_cast<std::uint64_t>(serial) << 32 | static_cast<std::uint32_t>(descriptor);
+epoll_event Event(int descriptor, std::uint32_t interest) {
+    return {.events = interest, .data = {.fd = descriptor}};
 }
 
 timespec TimeSpec(double seconds) {
@@ -34,14 +33,14 @@ timespec TimeSpec(double seconds) {
 }  // namespace
 
 void EventSource::leaveLoop() {
-    if (std::exchange(isValid_, false) && loop_ != nullptr) {
-        std::exchange(loop_, nullptr)->detach(*this);
+    if (std::exchange(isValid_, false) && std::exchange(isAttached_, false)) {
+        EventLoop::ofThisThread->detach(*this);
     }
 }
 
-void EventSource::setInterest(std::uint32_t interest) {
-    if (std::exchange(interest_, interest) != interest && loop_ != nullptr) {
-        loop_->modify(*this);
+void EventSource::setInterest(std::uint16_t interest) {
+    if (std::exchange(interest_, interest) != interest && isAttached_) {
+        EventLoop::ofThisThread->modify(*this);
     }
 }
 
@@ -66,12 +65,12 @@ bool EventTimer::fire(AbsoluteTime now) {
 EventLoop::EventLoop()
     : epoll_(epoll_create1(EPOLL_CLOEXEC)), wake_(eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)) {
     PLATFORM_ASSERT(epoll_.isOpen() && wake_.isOpen());
-    epoll_event event{.events = EPOLLIN, .data = {.u64 = Token(wake_.get(), 0)}};
+    epoll_event event = Event(wake_.get(), EPOLLIN);
     PLATFORM_ASSERT(epoll_ctl(epoll_.get(), EPOLL_CTL_ADD, wake_.get(), &event) == 0);
 }
 
 void EventLoop::attach(const std::shared_ptr<EventSource>& source) {
-    if (!source->isValid_ || source->loop_ != nullptr) {
+    if (!source->isValid_ || source->isAttached_) {
         return;
     }
     const int descriptor = source->descriptor_;
@@ -79,14 +78,13 @@ void EventLoop::attach(const std::shared_ptr<EventSource>& source) {
     if (sources_.size() <= index) {
         sources_.resize(index + 1);
     }
-    source->serial_ = ++lastSerial_;
-    epoll_event event{.events = source->interest_,
-                      .data = {.u64 = Token(descriptor, source->serial_)}};
+    epoll_event event = Event(descriptor, source->interest_);
     if (epoll_ctl(epoll_.get(), EPOLL_CTL_ADD, descriptor, &event) != 0) {
         return;  // out of memory for watches: the source stays silent, as one whose peer is silent
     }
     sources_[index] = source;
-    source->loop_ = this;
+    newcomers_.push_back(descriptor);
+    source->isAttached_ = true;
     ++sourceCount_;
 }
 
@@ -99,8 +97,7 @@ void EventLoop::detach(EventSource& source) {
 }
 
 void EventLoop::modify(const EventSource& source) {
-    epoll_event event{.events = source.interest_,
-                      .data = {.u64 = Token(source.descriptor_, source.serial_)}};
+    epoll_event event = Event(source.descriptor_, source.interest_);
     epoll_ctl(epoll_.get(), EPOLL_CTL_MOD, source.descriptor_, &event);
 }
 
@@ -197,26 +194,29 @@ bool EventLoop::isEmpty() {
 
 bool EventLoop::serveSources(double seconds) {
     std::array<epoll_event, kEventsPerTurn> events;
-    const timespec wait = TimeSpec(std::clamp(seconds, 0.0, kLongestWait));
+    const timespec limit = TimeSpec(std::clamp(seconds, 0.0, kLongestWait));
     const int count = epoll_pwait2(epoll_.get(),
                                    events.data(),
                                    static_cast<int>(events.size()),
-                                   seconds >= kLongestWait ? nullptr : &wait,
+                                   seconds >= kLongestWait ? nullptr : &limit,
                                    nullptr);
+    newcomers_.clear();
+    const std::uint64_t wait = ++waitCount_;
     bool handled = false;
-    for (int i = 0; i < count && !isStopped(); ++i) {
+    // A callout may run the loop: what is left of the batch is old then, and will be told again.
+    for (int i = 0; i < count && !isStopped() && wait == waitCount_; ++i) {
         const epoll_event& event = events[static_cast<std::size_t>(i)];
-        const auto descriptor = static_cast<std::size_t>(event.data.u64 & 0xFFFFFFFF);
-        if (descriptor == static_cast<std::size_t>(wake_.get())) {
+        const int descriptor = event.data.fd;
+        if (descriptor == wake_.get()) {
             std::uint64_t wakes = 0;
             (void)!read(wake_.get(), &wakes, sizeof wakes);  // what it says is in the work itself
             isWoken_ = false;
             continue;
         }
         // An earlier callout of this batch may have ended the source, or put another one in its
-        // place: the serial tells.
-        const auto source = sources_[descriptor];
-        if (source == nullptr || source->serial_ != event.data.u64 >> 32) {
+        // place, which the event does not mean: what is true of that one comes with the next wait.
+        const auto source = sources_[static_cast<std::size_t>(descriptor)];
+        if (source == nullptr || std::ranges::find(newcomers_, descriptor) != newcomers_.end()) {
             continue;
         }
         source->ready(event.events);

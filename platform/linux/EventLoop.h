@@ -15,7 +15,7 @@ namespace platform {
 
 class EventLoop;
 
-/// A descriptor that a loop waits for.
+/// A descriptor that a loop waits for. Belongs to that loop's thread.
 class EventSource : public RunLoopSource {
 public:
     virtual ~EventSource() = default;
@@ -32,20 +32,21 @@ public:
     [[nodiscard]] int descriptor() const { return descriptor_; }
 
 protected:
-    EventSource(int descriptor, std::uint32_t interest)
+    /// `interest` is EPOLLIN, EPOLLOUT, both or nothing.
+    EventSource(int descriptor, std::uint16_t interest)
         : descriptor_(descriptor), interest_(interest) {}
 
     /// Changes the EPOLL bits that are waited for.
-    void setInterest(std::uint32_t interest);
+    void setInterest(std::uint16_t interest);
 
 private:
     friend class EventLoop;
 
-    EventLoop* loop_ = nullptr;
+    // There are two sources a client, so they are kept small: the loop is that of the thread.
     const int descriptor_;
-    std::uint32_t interest_;
-    std::uint32_t serial_ = 0;  // tells this source from others that had its descriptor
+    std::uint16_t interest_;
     bool isValid_ = true;
+    bool isAttached_ = false;
 };
 
 class EventTimer final : public RunLoopTimer {
@@ -104,7 +105,8 @@ private:
     OwnedFd epoll_;
     OwnedFd wake_;                                       // an eventfd
     std::vector<std::shared_ptr<EventSource>> sources_;  // by descriptor; on the loop's thread
-    std::uint32_t lastSerial_ = 0;
+    std::vector<int> newcomers_;  // descriptors whose source came since the last wait
+    std::uint64_t waitCount_ = 0;
     std::size_t sourceCount_ = 0;
     std::atomic<bool> stopRequested_ = false;
     std::atomic<bool> isWoken_ = false;

@@ -5,6 +5,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <forward_list>
 #include <list>
 #include <map>
 
@@ -153,6 +154,13 @@ void ServiceConnection::closeSocket() {
     owner_.forget(*this);
 }
 
+/// There are as many as message tables in the program: two.
+const MessageSource::Receiver* SharedReceiver(const MessageSource::Receiver& wanted) {
+    static thread_local std::forward_list<MessageSource::Receiver> receivers;
+    const auto known = std::ranges::find(receivers, wanted);
+    return known != receivers.end() ? &*known : &receivers.emplace_front(wanted);
+}
+
 bool IsListening(int descriptor) {
     int value = 0;
     socklen_t size = sizeof value;
@@ -177,7 +185,8 @@ std::shared_ptr<RunLoopSource> MachPortCreateRunLoopSource(mach_port_t port,
     if (descriptor < 0) {
         return nullptr;
     }
-    const MessageSource::Service service{.port = port, .callout = callout, .context = context};
+    const MessageSource::Service service{
+        .port = port, .receiver = SharedReceiver({.callout = callout, .context = context})};
     if (IsListening(descriptor)) {
         return std::make_shared<ServiceSource>(descriptor, service);
     }

@@ -178,7 +178,7 @@ private:
 };
 
 MessageSource::MessageSource(int descriptor, const Service& service)
-    : EventSource(descriptor, EPOLLIN), service_(service) {}
+    : EventSource(descriptor, EPOLLIN), port_(service.port), receiver_(service.receiver) {}
 
 MessageSource::~MessageSource() = default;
 
@@ -242,12 +242,12 @@ MessageSource::Step MessageSource::answer(std::size_t arrived,
                                        arrived,
                                        arrival,
                                        descriptor,
-                                       {.localPort = service_.port,
-                                        .replyRoute = service_.port,
+                                       {.localPort = port_,
+                                        .replyRoute = port_,
                                         .sequenceNumber = sequenceNumber_++,
                                         .sender = &sender()});
     ReplyMessage reply;
-    service_.callout(request, reply, service_.context);
+    receiver_->callout(request, reply, receiver_->context);
     Outgoing outgoing(reply);
     outgoing.load();
     // A memory file that came is still here; a port would have become a name.

@@ -14,10 +14,17 @@ namespace platform {
 
 class MessageSource : public EventSource {
 public:
-    struct Service {
-        mach_port_t port = MACH_PORT_NULL;
+    /// Who answers. All sources that are served alike share one, which outlives them.
+    struct Receiver {
         MachMessageCallout callout = nullptr;
         const void* context = nullptr;
+
+        bool operator==(const Receiver&) const = default;
+    };
+
+    struct Service {
+        mach_port_t port = MACH_PORT_NULL;
+        const Receiver* receiver = nullptr;
     };
 
     MessageSource(int descriptor, const Service& service);
@@ -28,7 +35,7 @@ public:
     void ready(std::uint32_t events) final;
 
 protected:
-    [[nodiscard]] mach_port_t port() const { return service_.port; }
+    [[nodiscard]] mach_port_t port() const { return port_; }
 
     /// The socket is of no more use: close it. The source is out of the loop already.
     virtual void closeSocket() = 0;
@@ -48,8 +55,9 @@ private:
     [[nodiscard]] Step sendOrKeep(Outgoing&& reply);
     void close();
 
-    const Service service_;
+    const mach_port_t port_;
     std::uint32_t sequenceNumber_ = 0;
+    const Receiver* const receiver_;
     /// A reply that did not fit. This client's requests wait until it reads; nobody else notices.
     std::unique_ptr<Outgoing> pending_;
 };
