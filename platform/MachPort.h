@@ -63,7 +63,7 @@ using MachPortInvalidation = void (*)(MachPort& port, void* info);
 
 /// A send right whose death is noticed. What arrives on it is ignored and wakes nobody.
 /// Not thread-safe: it belongs to the loop of the thread that created it.
-class MachPort : public std::enable_shared_from_this<MachPort> {
+class MachPort {
 public:
     /// Null when the right is of a kind whose end cannot be noticed, or resources are short.
     /// The right itself stays with the caller.
@@ -76,7 +76,8 @@ public:
     [[nodiscard]] void* info() const;
     [[nodiscard]] bool isValid() const;
 
-    /// Stops watching; a callback that is set runs before this returns. Twice is harmless.
+    /// Stops watching; a callback that is set runs before this returns. Twice is harmless. Whoever
+    /// calls holds the object until then: the callback may let go of it.
     void invalidate();
 
     /// A port that is dead already is invalidated at once, and the callback runs before this

@@ -34,8 +34,7 @@ public:
         if (!EventSource::isValid()) {
             return;
         }
-        const auto keptThroughTheCallBack = shared_from_this();
-        leaveLoop();
+        leaveLoop();  // the loop, or who invalidates, still holds us through the callback
         if (const auto callBack = std::exchange(callBack_, nullptr); callBack != nullptr) {
             callBack(*this, info_);
         }
@@ -48,6 +47,8 @@ private:
     void* const info_;
     MachPortInvalidation callBack_ = nullptr;
 };
+
+static_assert(sizeof(WatchedPort) == 40, "with what its owners share it fills a block of 64");
 
 bool CanBeWatched(int descriptor) {
     const auto kind = ClassifyDescriptor(descriptor);

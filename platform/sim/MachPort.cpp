@@ -29,7 +29,8 @@ private:
     const std::weak_ptr<sim::Endpoint> end_;
 };
 
-class WatchedPort final : public platform::MachPort {
+class WatchedPort final : public platform::MachPort,
+                          public std::enable_shared_from_this<WatchedPort> {
 public:
     WatchedPort(platform::mach_port_t port,
                 const std::shared_ptr<sim::Endpoint>& end,

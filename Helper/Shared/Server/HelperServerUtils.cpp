@@ -225,7 +225,7 @@ void MachPortInvalidationCallBack(MachPort& watchPortObject, void* info) {
     }
     PLATFORM_ASSERT(server);
     const std::lock_guard guard(server->lock);
-    RemoveClient(&watchPortObject, server->clients.get(watchPortObject.shared_from_this()), server);
+    RemoveClient(&watchPortObject, server->clients.get(&watchPortObject), server);
     if (server->holdMask == 0 && server->clients.empty()) {
         ArmIdleTimer(server);
     }
@@ -233,12 +233,11 @@ void MachPortInvalidationCallBack(MachPort& watchPortObject, void* info) {
 
 void RemoveClient(MachPort* watchPortObject, mach_port_t privatePort, MobileHelperServer* server) {
     if (watchPortObject != nullptr) {
-        const auto keptUntilTheEnd = watchPortObject->shared_from_this();
         watchPortObject->setInvalidationCallBack(nullptr);
         watchPortObject->invalidate();
         ServerPortTableRemove(watchPortObject->port());
         mach_port_deallocate(watchPortObject->port());
-        server->clients.erase(keptUntilTheEnd);
+        server->clients.erase(watchPortObject);  // the last step: it may end the object
     }
     if (const auto source = server->clientSources.get(privatePort); source != nullptr) {
         source->invalidate();

@@ -5,6 +5,7 @@
 #include <algorithm>
 #include <cstddef>
 #include <iterator>
+#include <memory>
 #include <utility>
 #include <vector>
 
@@ -54,15 +55,29 @@ public:
     [[nodiscard]] Entry front() const { return {keys_.front(), values_.front()}; }
 
 private:
+    /// An object is found by its address alone, too.
+    template <typename Object>
+    static const Object* Comparable(const std::shared_ptr<Object>& key) {
+        return key.get();
+    }
+
+    template <typename AnyKey>
+    static const AnyKey& Comparable(const AnyKey& key) {
+        return key;
+    }
+
     /// Where the key is, or would be.
     template <typename AnyKey>
     [[nodiscard]] std::ptrdiff_t place(const AnyKey& key) const {
-        return std::lower_bound(keys_.begin(), keys_.end(), key) - keys_.begin();
+        const auto isBefore = [](const Key& entry, const AnyKey& wanted) {
+            return Comparable(entry) < Comparable(wanted);
+        };
+        return std::lower_bound(keys_.begin(), keys_.end(), key, isBefore) - keys_.begin();
     }
 
     template <typename AnyKey>
     [[nodiscard]] bool isAt(std::ptrdiff_t at, const AnyKey& key) const {
-        return at != std::ssize(keys_) && keys_.begin()[at] == key;
+        return at != std::ssize(keys_) && Comparable(keys_.begin()[at]) == Comparable(key);
     }
 
     std::vector<Key> keys_;

@@ -43,6 +43,18 @@ TEST(SortedTable, ErasesOneKeyOnce) {
     EXPECT_EQ(table.get(2), 20);
 }
 
+TEST(SortedTable, FindsAnObjectByItsAddress) {
+    SortedTable<std::shared_ptr<int>, int> table;
+    const auto first = std::make_shared<int>();
+    const auto second = std::make_shared<int>();
+    table.set(first, 1);
+    table.set(second, 2);
+    EXPECT_EQ(table.get(second.get()), 2);
+    EXPECT_TRUE(table.erase(first.get()));
+    EXPECT_EQ(table.get(first), 0);
+    EXPECT_EQ(table.size(), 1U);
+}
+
 /// Looks at its table while it goes.
 struct Witness {
     SortedTable<int, std::shared_ptr<Witness>>* table = nullptr;
