@@ -1,5 +1,6 @@
 #include <algorithm>
 #include <array>
+#include <iterator>
 #include <string>
 
 #include "platform/PropertyListEntries.h"
@@ -270,12 +271,15 @@ private:
         // One allocation for a large text: growing one would hold it twice.
         text.reserve(std::min(text_.find("</", at_), text_.size()) - at_);
         for (;;) {
-            const auto stop = text_.find_first_of("<&", at_);
-            if (stop == std::string_view::npos) {
+            // Values are long: find_first_of would make a call for each character of them.
+            const auto stop =
+                std::ranges::find_if(rest(), [](char c) { return c == '<' || c == '&'; });
+            if (stop == text_.end()) {
                 return std::nullopt;
             }
-            text.append(text_, at_, stop - at_);
-            at_ = stop;
+            const auto length = static_cast<std::size_t>(stop - text_.begin()) - at_;
+            text.append(text_, at_, length);
+            at_ += length;
             if (rest().starts_with("</")) {
                 return takeClosing(tag.name) ? std::optional(std::move(text)) : std::nullopt;
             }

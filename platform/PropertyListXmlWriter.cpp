@@ -118,20 +118,22 @@ private:
     }
 
     bool writeEscaped(std::string_view text) {
+        // Texts are long: find_first_of would make a call for each of their characters.
+        const auto isEscaped = [](char c) { return c == '<' || c == '>' || c == '&' || c == '\r'; };
         for (;;) {
-            const auto stop = text.find_first_of("<>&\r");
-            if (stop == std::string_view::npos) {
+            const auto stop = std::ranges::find_if(text, isEscaped);
+            if (stop == text.end()) {
                 return put(text);
             }
             // A parser of XML turns a bare carriage return into a line feed.
-            const std::string_view escape = text[stop] == '<'   ? "&lt;"
-                                            : text[stop] == '>' ? "&gt;"
-                                            : text[stop] == '&' ? "&amp;"
-                                                                : "&#13;";
-            if (!put(text.substr(0, stop)) || !put(escape)) {
+            const std::string_view escape = *stop == '<'   ? "&lt;"
+                                            : *stop == '>' ? "&gt;"
+                                            : *stop == '&' ? "&amp;"
+                                                           : "&#13;";
+            if (!put({text.begin(), stop}) || !put(escape)) {
                 return false;
             }
-            text.remove_prefix(stop + 1);
+            text = {stop + 1, text.end()};
         }
     }
 
