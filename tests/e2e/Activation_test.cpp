@@ -20,7 +20,7 @@ namespace {
 constexpr int kRounds = 25;
 constexpr std::size_t kArrivalsPerRound = 4;
 constexpr int kTriesMax = 100;
-constexpr auto kIdleInterval = std::chrono::milliseconds(300);
+constexpr auto kIdleInterval = std::chrono::milliseconds(600);
 
 /// The service manager's part, with the brisk daemon.
 class Activator {

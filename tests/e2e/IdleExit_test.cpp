@@ -34,7 +34,7 @@ TEST(IdleExit, ComesTenSecondsAfterTheLastClientAndNotBefore) {
 TEST(IdleExit, NeverComesToADaemonWithoutAnyClient) {
     phone::Daemon daemon(Brisk());
     ASSERT_EQ(phone::Client::checkIn(5999).code, 35) << "served, and no client";
-    std::this_thread::sleep_for(1500ms);
+    std::this_thread::sleep_for(2s);
     EXPECT_TRUE(daemon.isRunning());
 }
 
@@ -42,7 +42,7 @@ TEST(IdleExit, IsCancelledByTheNextClient) {
     phone::Daemon daemon(Brisk());
     phone::Client::checkIn().die();
     auto next = phone::Client::checkIn();
-    std::this_thread::sleep_for(1500ms);
+    std::this_thread::sleep_for(2s);
     EXPECT_TRUE(daemon.isRunning());
     next.die();
     EXPECT_EQ(daemon.waitForExit(), 0);
@@ -58,7 +58,7 @@ TEST(IdleExit, IsCancelledForGoodByAClientThatWasDeadOnArrival) {
         phone::Connection::toService().call(phone::CheckInMessage(), std::array{ends[1]}).code(),
         5);
     close(ends[1]);
-    std::this_thread::sleep_for(1500ms);
+    std::this_thread::sleep_for(2s);
     EXPECT_TRUE(daemon.isRunning()) << "nobody is left, and the timer stays cancelled";
     phone::Client::checkIn().die();
     EXPECT_EQ(daemon.waitForExit(), 0) << "the next client's end arms it again";
