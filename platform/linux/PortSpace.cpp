@@ -80,47 +80,48 @@ kern_return_t PortSpace::addSendRight(OwnedFd&& send, mach_port_t* name) {
     return KERN_SUCCESS;
 }
 
-kern_return_t PortSpace::makeSend(mach_port_t name) {
-    const std::lock_guard guard(lock_);
-    Slot* const slot = find(name);
-    if (slot == nullptr) {
+kern_return_t PortSpace::find(mach_port_t name, MachPortRight right, Slot** slot) {
+    *slot = find(name);
+    if (*slot == nullptr) {
         return KERN_INVALID_NAME;
     }
-    if (!slot->hasReceive) {
-        return KERN_INVALID_RIGHT;
+    const bool isHeld =
+        right == MachPortRight::kReceive ? (*slot)->hasReceive : (*slot)->sendRights != 0;
+    return isHeld ? KERN_SUCCESS : KERN_INVALID_RIGHT;
+}
+
+kern_return_t PortSpace::makeSend(mach_port_t name) {
+    const std::lock_guard guard(lock_);
+    Slot* slot = nullptr;
+    const kern_return_t code = find(name, MachPortRight::kReceive, &slot);
+    if (code == KERN_SUCCESS) {
+        ++slot->sendRights;
     }
-    ++slot->sendRights;
-    return KERN_SUCCESS;
+    return code;
 }
 
 kern_return_t PortSpace::dropReceive(mach_port_t name) {
     const std::lock_guard guard(lock_);
-    Slot* const slot = find(name);
-    if (slot == nullptr) {
-        return KERN_INVALID_NAME;
+    Slot* slot = nullptr;
+    const kern_return_t code = find(name, MachPortRight::kReceive, &slot);
+    if (code == KERN_SUCCESS) {
+        slot->hasReceive = 0;
+        slot->receive.reset();
+        slot->send.reset();
+        freeIfUnused(*slot);
     }
-    if (!slot->hasReceive) {
-        return KERN_INVALID_RIGHT;
-    }
-    slot->hasReceive = 0;
-    slot->receive.reset();
-    slot->send.reset();
-    freeIfUnused(*slot);
-    return KERN_SUCCESS;
+    return code;
 }
 
 kern_return_t PortSpace::dropSend(mach_port_t name) {
     const std::lock_guard guard(lock_);
-    Slot* const slot = find(name);
-    if (slot == nullptr) {
-        return KERN_INVALID_NAME;
+    Slot* slot = nullptr;
+    const kern_return_t code = find(name, MachPortRight::kSend, &slot);
+    if (code == KERN_SUCCESS) {
+        --slot->sendRights;
+        freeIfUnused(*slot);
     }
-    if (slot->sendRights == 0) {
-        return KERN_INVALID_RIGHT;
-    }
-    --slot->sendRights;
-    freeIfUnused(*slot);
-    return KERN_SUCCESS;
+    return code;
 }
 
 int PortSpace::receiveSocket(mach_port_t name) {

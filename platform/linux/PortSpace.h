@@ -52,6 +52,9 @@ private:
     static_assert(sizeof(Slot) == 12, "a port costs twelve bytes");
 
     [[nodiscard]] Slot* find(mach_port_t name);
+
+    /// The slot of a name with a right of that kind. KERN_INVALID_NAME, KERN_INVALID_RIGHT.
+    [[nodiscard]] kern_return_t find(mach_port_t name, MachPortRight right, Slot** slot);
     [[nodiscard]] kern_return_t takeSlot(Slot** slot, mach_port_t* name);
     void freeIfUnused(Slot& slot);
 
