@@ -5,7 +5,8 @@
 namespace platform {
 
 void ReturnFreedMemory() {
+    // Whether there was any matters to nobody.
     (void)malloc_trim(0);
-}  // whether there was any matters to nobody
+}
 
 }  // namespace platform

@@ -229,10 +229,12 @@ MessageSource::Step MessageSource::serveOne() {
     OwnedFd foreign(TakeDescriptor(message));
     const auto arrival = ArrivalOf(message, foreign.get());
     const auto length = static_cast<std::size_t>(arrived);
-    // No message at all, which is also how the end looks.
-    const bool isMessage = length >= sizeof(MachMsgHeader);
-    return isMessage ? answer(length, arrival, foreign.release())
-                     : (CloseForeignDescriptor(std::move(foreign)), Step::kClose);
+    if (length < sizeof(MachMsgHeader)) {
+        // No message at all, which is also how the end looks.
+        CloseForeignDescriptor(std::move(foreign));
+        return Step::kClose;
+    }
+    return answer(length, arrival, foreign.release());
 }
 
 MessageSource::Step MessageSource::answer(std::size_t arrived,

@@ -149,8 +149,8 @@ public:
 
     /// Nobody can have us write through what they put there: it is removed, and made anew by us.
     [[nodiscard]] int make(const PropertyList& entries, mode_t mode) {
-        (void)unlinkat(
-            place_.folder.get(), kTemporaryName, 0);  // what stays in the way fails the next line
+        // What stays in the way all the same fails the creation.
+        (void)unlinkat(place_.folder.get(), kTemporaryName, 0);
         const OwnedFd file(openat(place_.folder.get(),
                                   kTemporaryName,
                                   O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC,
@@ -245,8 +245,7 @@ std::string PreferenceFile::replace(const Contents& contents) const {
     PLATFORM_ASSERT(contents.state != State::kUnreadable);
     if (!XmlPropertyListSize(contents.entries)) {
         return "cannot be written: it would hold more than 16 MiB or 200,000 objects, or "
-               "characters "
-               "that XML cannot hold";
+               "characters that XML cannot hold";
     }
     const Place place = FinalPlace(path_);
     if (place.error != 0) {
