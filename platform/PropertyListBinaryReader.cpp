@@ -42,6 +42,7 @@ public:
 private:
     /// The marker of an object, and where what follows it starts.
     struct Object {
+        std::size_t marker = 0;
         unsigned kind = 0;
         unsigned low = 0;
         std::size_t at = 0;
@@ -81,7 +82,7 @@ private:
         if (at < kMagic.size() || at >= table_) {
             return std::nullopt;
         }
-        Object object{.kind = byteAt(at) >> 4, .low = byteAt(at) & 15, .at = at + 1};
+        Object object{.marker = at, .kind = byteAt(at) >> 4, .low = byteAt(at) & 15, .at = at + 1};
         const bool hasCount = object.kind == kData || object.kind == kAsciiText ||
                               object.kind == kUtf16Text || object.kind == kArray ||
                               object.kind == kDictionary;
@@ -176,7 +177,7 @@ private:
     }
 
     std::optional<PropertyList> readLeaf(const Object& object) {
-        const auto known = shared_.find(object.at);
+        const auto known = shared_.find(object.marker);
         auto leaf = known != shared_.end() ? std::optional(known->second)
                     : object.kind == kData ? makeData(object)
                                            : makeText(object);
@@ -192,7 +193,7 @@ private:
             }
             bytesToMakeLeft_ -= size;
             if (size >= kSharedFrom) {
-                shared_.emplace(object.at, *leaf);
+                shared_.emplace(object.marker, *leaf);
             }
         }
         return budget_.takeLeaf(size) ? leaf : std::nullopt;
@@ -296,6 +297,7 @@ private:
     unsigned referenceSize_ = 0;
     PropertyListBudget budget_;
     std::size_t bytesToMakeLeft_ = kPropertyListLimits.bytes;
+    /// By marker: objects that overlap may have their contents at one place.
     std::map<std::size_t, PropertyList> shared_;
 };
 

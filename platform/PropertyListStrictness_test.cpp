@@ -244,6 +244,16 @@ TEST(BinaryPropertyList, HasTheLastOfEqualKeysCount) {
     EXPECT_EQ(list, PropertyList(PropertyList::Dictionary{{"a", PropertyList(true)}}));
 }
 
+TEST(BinaryPropertyList, TellsObjectsApartThatOverlap) {
+    // The last byte of the data's count is also the marker of a text of one character, so that both
+    // have their contents at one place.
+    const auto list = Parse(
+        Binary({Bytes({0xA2, 1, 2}), Bytes({0x4F, 0x11, 0x04}), "\x51" + std::string(0x451, 'x')}));
+    const PropertyList::Data data(0x451, std::byte{'x'});
+    ASSERT_TRUE(list.has_value());
+    EXPECT_EQ(*list, PropertyList(PropertyList::Array{PropertyList(data), PropertyList("x")}));
+}
+
 TEST(BinaryPropertyList, TakesIntegersOfSixtyFourBits) {
     const std::string zeros(8, '\0');
     const std::string largest = Bytes({0x7F, 255, 255, 255, 255, 255, 255, 255});
