@@ -14,6 +14,24 @@ function(linefold_ship target)
     endif()
 endfunction()
 
+# linefold_module(NAME SOURCES... LIBS...): lib<NAME>.so, which the daemon loads when it first needs the
+# libraries that it stands on. It exports its own C functions, those that begin with "Linefold", and
+# nothing else.
+function(linefold_module)
+    cmake_parse_arguments(ARG "" "NAME" "SOURCES;LIBS" ${ARGN})
+    add_library(${ARG_NAME} MODULE ${ARG_SOURCES})
+    target_include_directories(${ARG_NAME} PRIVATE ${CMAKE_SOURCE_DIR} ${CMAKE_BINARY_DIR}/generated)
+    target_link_libraries(${ARG_NAME} PRIVATE ${ARG_LIBS})
+    target_link_options(${ARG_NAME} PRIVATE
+        -Wl,--exclude-libs,ALL -Wl,--version-script,${CMAKE_SOURCE_DIR}/cmake/module.map)
+    set_target_properties(${ARG_NAME} PROPERTIES
+        LIBRARY_OUTPUT_DIRECTORY ${CMAKE_BINARY_DIR}/bin/modules
+        LINK_DEPENDS ${CMAKE_SOURCE_DIR}/cmake/module.map)
+    linefold_ship(${ARG_NAME})
+    install(TARGETS ${ARG_NAME} DESTINATION ${LINEFOLD_LIBRARY_DIR})
+    add_dependencies(modules ${ARG_NAME})
+endfunction()
+
 # The whole core: the request table names the handlers, and the handlers use the server.
 set(LINEFOLD_CORE
     "$<LINK_GROUP:RESCAN,carrier,files,voicemail,location,heartbeat,lasd,helper_server>")

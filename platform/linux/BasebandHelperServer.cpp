@@ -4,7 +4,7 @@
 
 #include "platform/BuildConstants.h"
 #include "platform/linux/BasebandHelperModule.h"
-#include "platform/linux/DynamicLibrary.h"
+#include "platform/DynamicLibrary.h"
 
 namespace platform {
 namespace {

@@ -1,4 +1,4 @@
-#include "platform/linux/DynamicLibrary.h"
+#include "platform/DynamicLibrary.h"
 
 #include <dlfcn.h>
 #include <sys/stat.h>

@@ -12,6 +12,7 @@
 #include <cstdlib>
 #include <cstring>
 #include <optional>
+#include <vector>
 
 namespace platform {
 namespace {
@@ -91,32 +92,40 @@ bool CanBeReplaced(const std::string& path) {
     return lstat(path.c_str(), &status) == 0 ? S_ISSOCK(status.st_mode) : errno == ENOENT;
 }
 
-/// The file that we bound, so that only that one is unlinked.
+/// A file that we bound, so that only that one is unlinked.
 struct BoundSocket {
     std::string path;
     dev_t device = 0;
     ino_t inode = 0;
 };
 
-BoundSocket* boundSocket = nullptr;
+std::vector<BoundSocket>& BoundSockets() {
+    static auto& sockets = *new std::vector<BoundSocket>;
+    return sockets;
+}
 
-void UnlinkBoundSocket() {
-    struct stat status {};
+void UnlinkBoundSockets() {
+    for (const BoundSocket& bound : BoundSockets()) {
+        struct stat status {};
 
-    if (lstat(boundSocket->path.c_str(), &status) == 0 && status.st_dev == boundSocket->device &&
-        status.st_ino == boundSocket->inode) {
-        unlink(boundSocket->path.c_str());
+        if (lstat(bound.path.c_str(), &status) == 0 && status.st_dev == bound.device &&
+            status.st_ino == bound.inode) {
+            unlink(bound.path.c_str());
+        }
     }
 }
 
 void UnlinkAtExit(const std::string& path) {
     struct stat status {};
 
-    if (boundSocket == nullptr && lstat(path.c_str(), &status) == 0) {
-        boundSocket =
-            new BoundSocket{.path = path, .device = status.st_dev, .inode = status.st_ino};
-        (void)std::atexit(UnlinkBoundSocket);  // without it the next start replaces the dead socket
+    if (lstat(path.c_str(), &status) != 0) {
+        return;
     }
+    if (BoundSockets().empty()) {
+        // Where this fails, the next start replaces the dead socket.
+        (void)std::atexit(UnlinkBoundSockets);
+    }
+    BoundSockets().push_back({.path = path, .device = status.st_dev, .inode = status.st_ino});
 }
 
 }  // namespace
