@@ -39,6 +39,7 @@ struct Transfer {
     const LinefoldHttpRequest& request;
     LinefoldHttpResult& result;
     std::string location{};  ///< of the header that came last
+    bool isHeaderWhole = false;  ///< its empty line has come
     bool hasBody = false;
     bool isRedirectBody = false;  ///< its answer was ended where its body began
     bool isSinkFull = false;
@@ -124,6 +125,7 @@ std::size_t TakeHeaderLine(char* bytes,
         return size;  // a trailer is no header
     }
     const std::string_view line(bytes, size);
+    transfer.isHeaderWhole = line == "\r\n" || line == "\n";
     if (line.starts_with("HTTP/")) {
         transfer.location.clear();
     } else if (IsLocation(line)) {
@@ -229,7 +231,8 @@ Owned<curl_slist> HeaderList(const char* const* lines) {
 LinefoldHttpOutcome OutcomeOf(CURLcode code, const Transfer& transfer) {
     switch (code) {
         case CURLE_OK:
-            return LINEFOLD_HTTP_DONE;
+            // Where a connection ends in the middle of a header, libcurl sees an answer.
+            return transfer.isHeaderWhole ? LINEFOLD_HTTP_DONE : LINEFOLD_HTTP_CONNECTION_LOST;
         case CURLE_COULDNT_RESOLVE_HOST:
             return LINEFOLD_HTTP_HOST_NOT_FOUND;
         case CURLE_COULDNT_CONNECT:
@@ -295,6 +298,7 @@ LinefoldHttpOutcome PerformOnce(CURL* handle, Transfer& transfer, const char* ur
     transfer.result.status_code = 0;
     transfer.result.detail[0] = '\0';
     transfer.location.clear();
+    transfer.isHeaderWhole = false;
     transfer.hasBody = false;
     transfer.isRedirectBody = false;
     transfer.isCellularRefused = false;
