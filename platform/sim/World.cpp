@@ -184,6 +184,7 @@ void Reset(std::uint64_t seed) {
     ResetServices();
     ResetMemory();
     ResetMessagePorts();
+    ResetHttp();
     ResetLogs();
     world.random.seed(seed);
     world.now = 0;

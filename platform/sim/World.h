@@ -120,6 +120,7 @@ void ResetLogs();
 void ResetServices();
 void ResetMemory();
 void ResetMessagePorts();
+void ResetHttp();
 
 /// The daemon's exit sources see the exit of every process.
 void ExitAllProcesses();
