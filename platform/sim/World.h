@@ -119,6 +119,7 @@ void ResetProcesses();
 void ResetLogs();
 void ResetServices();
 void ResetMemory();
+void ResetMessagePorts();
 void ResetHttp();
 
 /// The daemon's exit sources see the exit of every process.
