@@ -20,6 +20,7 @@ using State = PropertyListFile::State;
 
 /// One name for all files of a folder: whatever a crash leaves behind, the next write removes.
 constexpr const char* kTemporaryName = ".linefold-mobile-helper.tmp";
+constexpr const char* kNotRegular = "is not a regular file";
 
 std::string ErrorText(int error) {
     return strerrordesc_np(error);
@@ -27,6 +28,15 @@ std::string ErrorText(int error) {
 
 Contents Unusable(State state, std::string complaint) {
     return {.state = state, .complaint = std::move(complaint)};
+}
+
+Contents NotOpened(int error, PropertyListFile::Links links) {
+    if (error == ENOENT) {
+        return {};
+    }
+    const bool isLink = error == ELOOP && links == PropertyListFile::Links::kRefused;
+    return Unusable(State::kUnreadable,
+                    isLink ? kNotRegular : "cannot be read: " + ErrorText(error));
 }
 
 /// The bytes of a file of at most the largest size, or an errno value. Files can grow while they
@@ -180,15 +190,13 @@ Contents PropertyListFile::read(Links links) const {
     const OwnedFd file(
         openat(folder_, name_.c_str(), O_RDONLY | O_NONBLOCK | O_NOCTTY | O_CLOEXEC | refusal));
     if (!file.isOpen()) {
-        return errno == ENOENT
-                   ? Contents()
-                   : Unusable(State::kUnreadable, "cannot be read: " + ErrorText(errno));
+        return NotOpened(errno, links);
     }
 
     struct stat status {};
 
     if (fstat(file.get(), &status) != 0 || !S_ISREG(status.st_mode)) {
-        return Unusable(State::kUnreadable, "is not a regular file");
+        return Unusable(State::kUnreadable, kNotRegular);
     }
     std::vector<std::byte> bytes;
     const bool isTooLarge = status.st_size > static_cast<off_t>(kPropertyListLimits.bytes);
