@@ -1,12 +1,7 @@
-// The cellular heartbeat and the radio manager's logging.
+// The cellular heartbeat.
 #include "Helper/Shared/Server/RequestProtocol.h"
 
 kern_return_t server_LFMobileHelperSetHeartbeatEnabled(mach_port_t /*port*/,
                                                        std::int32_t /*isEnabled*/) {
-    return platform::KERN_NOT_SUPPORTED;
-}
-
-kern_return_t server_LFMobileHelperSetRadioManagerLogging(mach_port_t /*port*/,
-                                                          std::int32_t /*isEnabled*/) {
     return platform::KERN_NOT_SUPPORTED;
 }

@@ -181,6 +181,9 @@ void Reset(std::uint64_t seed) {
     ResetPorts();
     ResetProcesses();
     ResetFiles();
+    ResetLibraries();
+    ResetMailbox();
+    ResetRadioManager();
     ResetServices();
     ResetMemory();
     ResetMessagePorts();
