@@ -19,8 +19,8 @@ struct FileStatus {
 /// The daemon is root and works below folders that the mobile user owns. On the way a symbolic link
 /// is followed if root owns it, or if it leads to something that the link's own owner owns;
 /// otherwise EPERM. ".." is taken as it stands. A resolution that failed is answered by every
-/// operation with its error. All operations return 0 or an errno value, and none follows a link in
-/// the last step.
+/// operation with its error. All operations return 0 or an errno value, and none but stat follows a
+/// link in the last step.
 class PathAccess {
 public:
     explicit PathAccess(std::string_view path);
@@ -33,11 +33,23 @@ public:
     /// lstat(2); `*status` is written on success only.
     [[nodiscard]] int lstat(FileStatus* status) const;
 
+    /// The same for what a link in the last step leads to, followed by the rule.
+    [[nodiscard]] int stat(FileStatus* status) const;
+
     /// remove(3): a file, a link, or an empty directory.
     [[nodiscard]] int remove() const;
 
     /// symlink(2): makes the path a link with these contents; EEXIST when something is there.
     [[nodiscard]] int symlink(std::string_view contents) const;
+
+    /// mkdir(2): an empty directory with this mode less the process's mask.
+    [[nodiscard]] int makeDirectory(std::uint32_t mode) const;
+
+    /// rename(2): what is here takes the place of what may be there.
+    [[nodiscard]] int moveOnto(const PathAccess& destination) const;
+
+    /// fsync(2) of the file or directory, and then of the folder that it lies in.
+    [[nodiscard]] int synchronize() const;
 
 private:
     struct State;

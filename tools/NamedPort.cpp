@@ -60,8 +60,7 @@ std::optional<PortMessage> NamedPort::receive(int timeoutMs) {
 }
 
 void NamedPort::accept() {
-    OwnedFd connection(
-        accept4(listening_.get(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK));
+    OwnedFd connection(accept4(listening_.get(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK));
     if (!connection.isOpen() || !Watch(events_.get(), connection.get())) {
         return;
     }

@@ -20,9 +20,9 @@ struct PortMessage {
     std::vector<std::byte> body{};
 };
 
-/// The receiving end of /run/linefold/<name>: everybody may connect, and each datagram is a message,
-/// a header of 24 bytes and data behind it. A datagram that is shorter than its header, or whose
-/// header lies about its size, ends its connection.
+/// The receiving end of /run/linefold/<name>: everybody may connect, and each datagram is a
+/// message, a header of 24 bytes and data behind it. A datagram that is shorter than its header, or
+/// whose header lies about its size, ends its connection.
 class NamedPort {
 public:
     /// None when somebody alive owns the name, or it cannot be had. Held until the process ends.

@@ -1,0 +1,94 @@
+#include "platform/linux/PathWalk.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <array>
+#include <cerrno>
+#include <climits>
+
+namespace platform {
+
+Opened OpenPath(int directory, const char* name) {
+    OwnedFd file(openat(directory, name, O_PATH | O_NOFOLLOW | O_CLOEXEC));
+    const int error = file.isOpen() ? 0 : errno;
+    return {.file = std::move(file), .error = error};
+}
+
+Opened PathWalk::follow(std::string_view path, int from) {
+    Opened place = OpenPath(from, path.starts_with('/') ? "/" : ".");
+    while (place.error == 0) {
+        const auto start = path.find_first_not_of('/');
+        if (start == std::string_view::npos) {
+            break;
+        }
+        path.remove_prefix(start);
+        const std::string name(path.substr(0, path.find('/')));
+        path.remove_prefix(name.size());
+        if (name != ".") {
+            place = step(place.file, name);
+        }
+    }
+    return place;
+}
+
+Opened PathWalk::step(const OwnedFd& directory, const std::string& name) {
+    Opened found = OpenPath(directory.get(), name.c_str());
+
+    struct stat status {};
+
+    if (found.error == 0 && fstat(found.file.get(), &status) != 0) {
+        found.error = errno;
+    }
+    if (found.error != 0 || !S_ISLNK(status.st_mode)) {
+        return found;
+    }
+    return followLink(directory, found.file, status.st_uid);
+}
+
+/// A link is read from its own descriptor, and its target judged by its: nothing that is put in
+/// their places meanwhile counts.
+Opened PathWalk::followLink(const OwnedFd& directory, const OwnedFd& link, uid_t linkOwner) {
+    std::array<char, PATH_MAX> text{};
+    const ssize_t length = readlinkat(link.get(), "", text.data(), text.size());
+    if (length < 0) {
+        return {.file = {}, .error = errno};
+    }
+    if (--linksLeft_ < 0) {
+        return {.file = {}, .error = ELOOP};
+    }
+    Opened target = follow({text.data(), static_cast<std::size_t>(length)}, directory.get());
+
+    struct stat status {};
+
+    if (target.error == 0 && fstat(target.file.get(), &status) != 0) {
+        target.error = errno;
+    }
+    // The mobile user may lead us to what is the mobile user's, and nowhere else.
+    if (target.error == 0 && linkOwner != 0 && status.st_uid != linkOwner) {
+        return {.file = {}, .error = EPERM};
+    }
+    return target;
+}
+
+SplitPath Split(std::string_view path) {
+    const auto lastByte = path.find_last_not_of('/');
+    if (lastByte == std::string_view::npos) {
+        return {.parent = path, .last = "."};
+    }
+    const auto slash = path.rfind('/', lastByte);
+    const auto start = slash == std::string_view::npos ? 0 : slash + 1;
+    return {.parent = path.substr(0, start),
+            .last = path.substr(start),
+            .endsInSlash = lastByte + 1 != path.size()};
+}
+
+Opened OpenParent(std::string_view path) {
+    if (path.empty()) {
+        return {.file = {}, .error = ENOENT};
+    }
+    return PathWalk().follow(Split(path).parent, AT_FDCWD);
+}
+
+}  // namespace platform
