@@ -118,6 +118,8 @@ void ResetFiles();
 void ResetProcesses();
 void ResetLogs();
 void ResetServices();
+void ResetGeocoding();
+void ResetTelephony();
 void ResetMemory();
 
 /// The daemon's exit sources see the exit of every process.
