@@ -185,6 +185,7 @@ void Reset(std::uint64_t seed) {
     ResetGeocoding();
     ResetTelephony();
     ResetMemory();
+    ResetHttp();
     ResetLogs();
     world.random.seed(seed);
     world.now = 0;

@@ -121,6 +121,7 @@ void ResetServices();
 void ResetGeocoding();
 void ResetTelephony();
 void ResetMemory();
+void ResetHttp();
 
 /// The daemon's exit sources see the exit of every process.
 void ExitAllProcesses();
