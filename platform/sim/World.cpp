@@ -185,6 +185,8 @@ void Reset(std::uint64_t seed) {
     ResetMailbox();
     ResetRadioManager();
     ResetServices();
+    ResetGeocoding();
+    ResetTelephony();
     ResetMemory();
     ResetMessagePorts();
     ResetHttp();

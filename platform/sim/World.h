@@ -121,6 +121,8 @@ void ResetRadioManager();
 void ResetProcesses();
 void ResetLogs();
 void ResetServices();
+void ResetGeocoding();
+void ResetTelephony();
 void ResetMemory();
 void ResetMessagePorts();
 void ResetHttp();
