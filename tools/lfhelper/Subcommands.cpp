@@ -10,7 +10,9 @@
 #include <vector>
 
 #include "Helper/Shared/Server/MessageLayouts.h"
+#include "tools/lfhelper/HeartbeatCommands.h"
 #include "tools/lfhelper/HexDump.h"
+#include "tools/lfhelper/LocationCommands.h"
 #include "tools/lfhelper/PreferenceCommands.h"
 
 namespace lfhelper {
@@ -137,7 +139,7 @@ Preparation PrepareRaw(const CommandLine& line) {
     return {.request = [message](LFMobileHelper* helper) { return SendAndDump(helper, message); }};
 }
 
-constexpr std::array<Subcommand, 8> kSubcommands{{
+constexpr auto kSubcommands = std::to_array<Subcommand>({
     {"check-in",
      "",
      "ask whether the service is there and takes this caller",
@@ -241,6 +243,77 @@ constexpr std::array<Subcommand, 8> kSubcommands{{
      2,
      2,
      PreparePreferencesRemove},
+    {"country-code",
+     "",
+     "show the country code that is configured",
+     "Shows the country code of the geocoding services' configuration. That there is none is no\n"
+     "failure of the service: the exit status is 4 then.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper country-code\n"
+     "  lfhelper --json country-code\n",
+     0,
+     0,
+     PrepareCountryCode},
+    {"civic-address",
+     "[--wait] LATITUDE LONGITUDE",
+     "have the civic address of a place sent to the telephony daemon",
+     "Asks for the country code, state, city and postal code of a place, in degrees. The service\n"
+     "takes the request and sends the result to the telephony daemon, within about 5 seconds.\n"
+     "\n"
+     "  --wait    wait for the result in the telephony daemon's place, at most 10 seconds, and "
+     "show\n"
+     "            it. While the telephony daemon runs this cannot be: nothing is asked, and the\n"
+     "            exit status is 3. It is 1 when no result comes.\n"
+     "\n"
+     "A number like -.5 goes behind --, or is written -0.5.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper civic-address 51.5007 -0.1246\n"
+     "  lfhelper civic-address --wait --json 51.5007 -0.1246\n",
+     2,
+     2,
+     PrepareCivicAddress},
+    {"wan-ip",
+     "[--wait]",
+     "have this device's public address sent to the telephony daemon",
+     "Asks for the address under which this device is seen from the network outside. The service\n"
+     "takes the request and sends the result to the telephony daemon, within about 5 seconds; an\n"
+     "empty address means that it could not be found out.\n"
+     "\n"
+     "  --wait    wait for the result in the telephony daemon's place, at most 10 seconds, and "
+     "show\n"
+     "            it. While the telephony daemon runs this cannot be: nothing is asked, and the\n"
+     "            exit status is 3. It is 1 when no result comes.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper wan-ip\n"
+     "  lfhelper wan-ip --wait\n",
+     0,
+     0,
+     PrepareWanIp},
+    {"heartbeat",
+     "STATE",
+     "start or stop the echo requests over the cellular interface",
+     "With STATE \"on\" the service sends an echo request over pdp_ip0 at once and then every two\n"
+     "seconds, over whatever interface leads to its host while there is no pdp_ip0, until STATE "
+     "is\n"
+     "\"off\". It answers at once; what becomes of the requests is not told anywhere.\n"
+     "\n"
+     "A heartbeat belongs to the service and not to the caller: it goes on when this command "
+     "ends,\n"
+     "and keeps the service from leaving. \"off\" ends that, whoever says it. Each \"on\" while "
+     "it is\n"
+     "on begins the rhythm anew, and keeps the service for good: then it ends when it is told to "
+     "end\n"
+     "(SIGTERM), and no more by itself. \"off\" while it is off changes nothing.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper heartbeat on\n"
+     "  lfhelper heartbeat off\n",
+     1,
+     1,
+     PrepareHeartbeat},
     {"raw",
      "[--complex] [--claim-size N] ID [HEX]",
      "send a message as it is, and show the reply field by field",
@@ -259,7 +332,7 @@ constexpr std::array<Subcommand, 8> kSubcommands{{
      1,
      2,
      PrepareRaw},
-}};
+});
 
 }  // namespace
 
