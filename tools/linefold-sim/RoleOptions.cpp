@@ -22,6 +22,14 @@ struct FreeAddresses {
     void operator()(addrinfo* list) const { freeaddrinfo(list); }
 };
 
+/// The resolver takes larger numbers, too, and cuts them.
+bool IsPort(const std::string& text) {
+    std::uint16_t number = 0;
+    const char* const end = text.data() + text.size();
+    const auto [rest, error] = std::from_chars(text.data(), end, number);
+    return error == std::errc{} && rest == end;
+}
+
 using AddressList = std::unique_ptr<addrinfo, FreeAddresses>;
 
 /// Null for what is no place.
@@ -36,7 +44,7 @@ AddressList AddressOf(const std::string& place) {
     hints.ai_socktype = SOCK_STREAM;
     addrinfo* list = nullptr;
     const std::string port = colon == std::string::npos ? "" : place.substr(colon + 1);
-    const bool isPlace = !host.empty() && !port.empty() &&
+    const bool isPlace = !host.empty() && IsPort(port) &&
                          getaddrinfo(host.c_str(), port.c_str(), &hints, &list) == 0;
     return AddressList(isPlace ? list : nullptr);
 }
