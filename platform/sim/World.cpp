@@ -180,11 +180,16 @@ void Reset(std::uint64_t seed) {
     world.script.tasks.clear();
     ResetPorts();
     ResetProcesses();
+    ResetEcho();
     ResetFiles();
+    ResetLibraries();
+    ResetMailbox();
+    ResetRadioManager();
     ResetServices();
     ResetGeocoding();
     ResetTelephony();
     ResetMemory();
+    ResetMessagePorts();
     ResetHttp();
     ResetLogs();
     world.random.seed(seed);

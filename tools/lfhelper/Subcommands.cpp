@@ -10,6 +10,7 @@
 #include <vector>
 
 #include "Helper/Shared/Server/MessageLayouts.h"
+#include "tools/lfhelper/HeartbeatCommands.h"
 #include "tools/lfhelper/HexDump.h"
 #include "tools/lfhelper/LocationCommands.h"
 #include "tools/lfhelper/PreferenceCommands.h"
@@ -138,7 +139,7 @@ Preparation PrepareRaw(const CommandLine& line) {
     return {.request = [message](LFMobileHelper* helper) { return SendAndDump(helper, message); }};
 }
 
-constexpr std::array<Subcommand, 11> kSubcommands{{
+constexpr auto kSubcommands = std::to_array<Subcommand>({
     {"check-in",
      "",
      "ask whether the service is there and takes this caller",
@@ -291,6 +292,28 @@ constexpr std::array<Subcommand, 11> kSubcommands{{
      0,
      0,
      PrepareWanIp},
+    {"heartbeat",
+     "STATE",
+     "start or stop the echo requests over the cellular interface",
+     "With STATE \"on\" the service sends an echo request over pdp_ip0 at once and then every two\n"
+     "seconds, over whatever interface leads to its host while there is no pdp_ip0, until STATE "
+     "is\n"
+     "\"off\". It answers at once; what becomes of the requests is not told anywhere.\n"
+     "\n"
+     "A heartbeat belongs to the service and not to the caller: it goes on when this command "
+     "ends,\n"
+     "and keeps the service from leaving. \"off\" ends that, whoever says it. Each \"on\" while "
+     "it is\n"
+     "on begins the rhythm anew, and keeps the service for good: then it ends when it is told to "
+     "end\n"
+     "(SIGTERM), and no more by itself. \"off\" while it is off changes nothing.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper heartbeat on\n"
+     "  lfhelper heartbeat off\n",
+     1,
+     1,
+     PrepareHeartbeat},
     {"raw",
      "[--complex] [--claim-size N] ID [HEX]",
      "send a message as it is, and show the reply field by field",
@@ -309,7 +332,7 @@ constexpr std::array<Subcommand, 11> kSubcommands{{
      1,
      2,
      PrepareRaw},
-}};
+});
 
 }  // namespace
 
