@@ -82,7 +82,7 @@ TEST(Races, AreNotBetweenTheMainLoopAndTheQueues) {
         for (int i = 0; i < kClients; ++i) {
             clients.emplace_back([&answers, i] { BeAClient(i, answers); });
         }
-        EXPECT_TRUE(phone::Eventually([&] { return answers > 100 * (life + 1); }));
+        EXPECT_TRUE(phone::Eventually([&] { return answers > 50 * (life + 1); }));
         daemon.signal(SIGTERM);
         EXPECT_EQ(daemon.waitForExit(), 0) << Reports("/tmp/reports");
         for (auto& client : clients) {
