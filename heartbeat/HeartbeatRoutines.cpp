@@ -1,4 +1,4 @@
-// The cellular heartbeat and the radio manager's logging.
+// The cellular heartbeat.
 #include "Helper/Shared/Server/HelperServerUtils.h"
 #include "Helper/Shared/Server/RequestProtocol.h"
 #include "heartbeat/HeartbeatMonitor.h"
@@ -8,9 +8,4 @@ kern_return_t server_LFMobileHelperSetHeartbeatEnabled(mach_port_t port, std::in
     const auto work = isEnabled != 0 ? HeartbeatStart : HeartbeatStop;
     TheHeartbeatMonitor().queue.async([work, server] { work(server); });
     return platform::KERN_SUCCESS;
-}
-
-kern_return_t server_LFMobileHelperSetRadioManagerLogging(mach_port_t /*port*/,
-                                                          std::int32_t /*isEnabled*/) {
-    return platform::KERN_NOT_SUPPORTED;
 }

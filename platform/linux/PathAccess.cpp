@@ -5,9 +5,11 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <cstring>
 
 #include "platform/linux/OwnedFd.h"
 #include "platform/linux/PathWalk.h"
+#include "platform/linux/PlatformLog.h"
 
 namespace platform {
 namespace {
@@ -38,6 +40,7 @@ int Synchronize(int directory, const char* name) {
 }  // namespace
 
 struct PathAccess::State {
+    std::string path;
     OwnedFd parent;
     std::string last;
     bool endsInSlash = false;
@@ -47,7 +50,8 @@ struct PathAccess::State {
 PathAccess::PathAccess(std::string_view path) : state_(std::make_unique<State>()) {
     const SplitPath split = Split(path);
     Opened parent = OpenParent(path);
-    *state_ = {.parent = std::move(parent.file),
+    *state_ = {.path = std::string(path),
+               .parent = std::move(parent.file),
                .last = std::string(split.last),
                .endsInSlash = split.endsInSlash,
                .error = parent.error};
@@ -111,11 +115,21 @@ int PathAccess::moveOnto(const PathAccess& destination) const {
 }
 
 int PathAccess::synchronize() const {
-    if (state_->error != 0) {
-        return state_->error;
+    int error = state_->error;
+    if (error == 0) {
+        error = Synchronize(state_->parent.get(), state_->last.c_str());
     }
-    const int error = Synchronize(state_->parent.get(), state_->last.c_str());
-    return error != 0 ? error : Synchronize(state_->parent.get(), ".");
+    if (error == 0) {
+        error = Synchronize(state_->parent.get(), ".");
+    }
+    if (error != 0) {
+        // Whoever asked has no line for this, and the disk is an operator's to mend.
+        PlatformLog(LogLevel::kError,
+                    "path access: %s could not be brought to disk: %s",
+                    state_->path.c_str(),
+                    std::strerror(error));
+    }
+    return error;
 }
 
 }  // namespace platform

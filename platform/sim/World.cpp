@@ -182,8 +182,15 @@ void Reset(std::uint64_t seed) {
     ResetProcesses();
     ResetEcho();
     ResetFiles();
+    ResetLibraries();
+    ResetMailbox();
+    ResetRadioManager();
     ResetServices();
+    ResetGeocoding();
+    ResetTelephony();
     ResetMemory();
+    ResetMessagePorts();
+    ResetHttp();
     ResetLogs();
     world.random.seed(seed);
     world.now = 0;

@@ -116,10 +116,17 @@ void ResetQueues();
 void ResetPorts();
 void ResetEcho();
 void ResetFiles();
+void ResetLibraries();
+void ResetMailbox();
+void ResetRadioManager();
 void ResetProcesses();
 void ResetLogs();
 void ResetServices();
+void ResetGeocoding();
+void ResetTelephony();
 void ResetMemory();
+void ResetMessagePorts();
+void ResetHttp();
 
 /// The daemon's exit sources see the exit of every process.
 void ExitAllProcesses();
