@@ -324,6 +324,28 @@ TEST_F(LfhelperTest, ShowsWhatStandsBehindTheFieldsOfARawReply) {
     EXPECT_TRUE(Contains(outcome.output, "|DE..............|\n"));
 }
 
+TEST_F(LfhelperTest, SwitchesTheHeartbeat) {
+    for (const bool isOn : {true, false}) {
+        Service another;
+        another.play([this](Service& self) {
+            const Session session = self.checkIn();
+            request = Receive(session.port.get()).bytes;
+            Send(session.port.get(), SimpleReply(8683562, 0));
+        });
+        const auto outcome = RunProgram(another, isOn ? "heartbeat on" : "heartbeat off");
+        EXPECT_EQ(outcome.exitStatus, 0) << outcome.output;
+        ASSERT_EQ(request.size(), 36U);
+        EXPECT_EQ(request[32], isOn ? 1 : 0);
+    }
+}
+
+TEST_F(LfhelperTest, TellsProgramsOfTheHeartbeat) {
+    const auto outcome = runAnswered("--json heartbeat on", SimpleReply(8683562, 5));
+    EXPECT_EQ(outcome.exitStatus, 1);
+    EXPECT_TRUE(Contains(outcome.output, "\"state\":\"on\"")) << outcome.output;
+    EXPECT_TRUE(Contains(outcome.output, "\"code\":5"));
+}
+
 TEST_F(LfhelperTest, ShowsARawBulkReply) {
     const auto outcome = runAnswered("raw 8683572", BulkReply(8683572, 3, {'a', 'b', 0xFF}));
     EXPECT_EQ(outcome.exitStatus, 0);
