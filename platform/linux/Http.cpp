@@ -21,8 +21,6 @@ namespace {
 using Compression::GzipDecoder;
 using platform::LogLevel;
 
-constexpr std::size_t kBodyMax = 256UL << 20;
-
 /// Of all header lines together, those of interim answers and redirects included.
 constexpr std::size_t kHeaderMax = 256UL << 10;
 
@@ -51,6 +49,8 @@ std::string_view Trimmed(std::string_view text) {
 /// Takes an answer as it arrives.
 class Collector final {
 public:
+    explicit Collector(std::size_t bodyMax) : bodyMax_(bodyMax) {}
+
     [[nodiscard]] bool takeHeaderLine(std::string_view line) {
         headerSize_ += line.size();
         if (headerSize_ > kHeaderMax) {
@@ -116,7 +116,7 @@ private:
             return false;
         }
         decoder_ = std::make_unique<GzipDecoder>(
-            kBodyMax, [this](std::span<const std::byte> bytes) { return append(bytes); });
+            bodyMax_, [this](std::span<const std::byte> bytes) { return append(bytes); });
         return true;
     }
 
@@ -125,14 +125,14 @@ private:
     /// moves.
     void reserveBody() {
         try {
-            parts_.body.reserve(kBodyMax);
+            parts_.body.reserve(bodyMax_);
         } catch (const std::bad_alloc&) {
             parts_.body.clear();
         }
     }
 
     bool append(std::span<const std::byte> bytes) {
-        if (bytes.size() > kBodyMax - parts_.body.size()) {
+        if (bytes.size() > bodyMax_ - parts_.body.size()) {
             return refuse(ErrorType::kBodyTooLarge);
         }
         parts_.body.insert(parts_.body.end(), bytes.begin(), bytes.end());
@@ -152,6 +152,7 @@ private:
         return refuse(ErrorType::kBadAnswer);
     }
 
+    const std::size_t bodyMax_;
     HttpResponse::Parts parts_;
     std::optional<ErrorType> refusal_;
     std::unique_ptr<GzipDecoder> decoder_;
@@ -196,23 +197,25 @@ std::vector<const char*> Pointers(const std::vector<std::string>& lines) {
 /// Null when there is no module.
 std::shared_ptr<HttpResponse> Get(const std::string& url,
                                   const HeaderMap& headers,
-                                  CellularUse cellularUse) {
+                                  const HttpSession& session) {
     if (TheModule().get == nullptr) {
         platform::PlatformLog(
             LogLevel::kError, "no HTTP client: %s cannot be used", ModulePath().c_str());
         return nullptr;
     }
-    Collector collector;
+    Collector collector(session.bodyLimit());
     const auto lines = HeaderLines(headers);
     const auto pointers = Pointers(lines);
     const LinefoldHttpRequest request{
         .url = url.c_str(),
         .header_lines = pointers.data(),
-        .is_cellular_allowed = cellularUse == CellularUse::kAllowed ? 1 : 0,
-        .body_max = kBodyMax,
+        .is_cellular_allowed = session.cellularUse() == CellularUse::kAllowed ? 1 : 0,
+        .body_max = session.bodyLimit(),
         .connect_timeout_ms = platform::kHttpConnectTimeoutMs,
         .stall_timeout_s = platform::kHttpStallTimeoutSeconds,
-        .total_timeout_s = platform::kHttpTotalTimeoutSeconds,
+        .total_timeout_s =
+            std::min(session.timeLimitSeconds().value_or(platform::kHttpTotalTimeoutSeconds),
+                     platform::kHttpTotalTimeoutSeconds),
         .context = &collector,
         .take_header_line = &TakeHeaderLine,
         .take_body = &TakeBody,
@@ -242,8 +245,8 @@ void HttpRequest::start(std::vector<std::byte> body) {
     PLATFORM_ASSERT(completionQueue_ && completionHandler_ && body.empty());
     // What the session says now holds, and the network's thread does not look at it again.
     const platform::SerialQueue network("com.vendra.http", platform::QualityOfService::kUtility);
-    network.async([self = shared_from_this(), use = session_->cellularUse()] {
-        auto response = Get(self->url_, self->headers_, use);
+    network.async([self = shared_from_this(), session = *session_] {
+        auto response = Get(self->url_, self->headers_, session);
         self->completionQueue_->async(
             [response, handler = std::exchange(self->completionHandler_, nullptr)] {
                 handler(response);

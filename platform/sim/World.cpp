@@ -182,6 +182,8 @@ void Reset(std::uint64_t seed) {
     ResetProcesses();
     ResetFiles();
     ResetServices();
+    ResetGeocoding();
+    ResetTelephony();
     ResetMemory();
     ResetMessagePorts();
     ResetHttp();

@@ -118,6 +118,8 @@ void ResetFiles();
 void ResetProcesses();
 void ResetLogs();
 void ResetServices();
+void ResetGeocoding();
+void ResetTelephony();
 void ResetMemory();
 void ResetMessagePorts();
 void ResetHttp();

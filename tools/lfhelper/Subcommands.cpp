@@ -11,6 +11,7 @@
 
 #include "Helper/Shared/Server/MessageLayouts.h"
 #include "tools/lfhelper/HexDump.h"
+#include "tools/lfhelper/LocationCommands.h"
 #include "tools/lfhelper/PreferenceCommands.h"
 
 namespace lfhelper {
@@ -137,7 +138,7 @@ Preparation PrepareRaw(const CommandLine& line) {
     return {.request = [message](LFMobileHelper* helper) { return SendAndDump(helper, message); }};
 }
 
-constexpr std::array<Subcommand, 8> kSubcommands{{
+constexpr std::array<Subcommand, 11> kSubcommands{{
     {"check-in",
      "",
      "ask whether the service is there and takes this caller",
@@ -241,6 +242,55 @@ constexpr std::array<Subcommand, 8> kSubcommands{{
      2,
      2,
      PreparePreferencesRemove},
+    {"country-code",
+     "",
+     "show the country code that is configured",
+     "Shows the country code of the geocoding services' configuration. That there is none is no\n"
+     "failure of the service: the exit status is 4 then.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper country-code\n"
+     "  lfhelper --json country-code\n",
+     0,
+     0,
+     PrepareCountryCode},
+    {"civic-address",
+     "[--wait] LATITUDE LONGITUDE",
+     "have the civic address of a place sent to the telephony daemon",
+     "Asks for the country code, state, city and postal code of a place, in degrees. The service\n"
+     "takes the request and sends the result to the telephony daemon, within about 5 seconds.\n"
+     "\n"
+     "  --wait    wait for the result in the telephony daemon's place, at most 10 seconds, and "
+     "show\n"
+     "            it. While the telephony daemon runs this cannot be: nothing is asked, and the\n"
+     "            exit status is 3. It is 1 when no result comes.\n"
+     "\n"
+     "A number like -.5 goes behind --, or is written -0.5.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper civic-address 51.5007 -0.1246\n"
+     "  lfhelper civic-address --wait --json 51.5007 -0.1246\n",
+     2,
+     2,
+     PrepareCivicAddress},
+    {"wan-ip",
+     "[--wait]",
+     "have this device's public address sent to the telephony daemon",
+     "Asks for the address under which this device is seen from the network outside. The service\n"
+     "takes the request and sends the result to the telephony daemon, within about 5 seconds; an\n"
+     "empty address means that it could not be found out.\n"
+     "\n"
+     "  --wait    wait for the result in the telephony daemon's place, at most 10 seconds, and "
+     "show\n"
+     "            it. While the telephony daemon runs this cannot be: nothing is asked, and the\n"
+     "            exit status is 3. It is 1 when no result comes.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper wan-ip\n"
+     "  lfhelper wan-ip --wait\n",
+     0,
+     0,
+     PrepareWanIp},
     {"raw",
      "[--complex] [--claim-size N] ID [HEX]",
      "send a message as it is, and show the reply field by field",
