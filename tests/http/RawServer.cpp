@@ -7,6 +7,7 @@
 #include <sched.h>
 #include <sys/socket.h>
 
+#include <cctype>
 #include <cstdlib>
 
 namespace web {
@@ -19,7 +20,7 @@ bool IsReady(int socket, short events, int milliseconds) {
     return poll(&entry, 1, milliseconds) == 1 && (entry.revents & events) != 0;
 }
 
-/// Everything up to the empty line.
+/// Everything up to the empty line; of what does not begin with a letter, the first byte.
 std::string ReadRequest(int socket, const std::atomic<bool>& isStopping) {
     std::string request;
     while (!isStopping && request.find("\r\n\r\n") == std::string::npos) {
@@ -31,6 +32,9 @@ std::string ReadRequest(int socket, const std::atomic<bool>& isStopping) {
             break;
         }
         request.push_back(byte);
+        if (std::isalpha(static_cast<unsigned char>(request.front())) == 0) {
+            break;
+        }
     }
     return request;
 }
