@@ -14,6 +14,7 @@
 #include "tools/lfhelper/HexDump.h"
 #include "tools/lfhelper/LocationCommands.h"
 #include "tools/lfhelper/PreferenceCommands.h"
+#include "tools/lfhelper/UpdateCommands.h"
 
 namespace lfhelper {
 namespace {
@@ -140,6 +141,7 @@ Preparation PrepareRaw(const CommandLine& line) {
 }
 
 constexpr auto kSubcommands = std::to_array<Subcommand>({
+constexpr std::array<Subcommand, 12> kSubcommands{{
     {"check-in",
      "",
      "ask whether the service is there and takes this caller",
@@ -243,6 +245,33 @@ constexpr auto kSubcommands = std::to_array<Subcommand>({
      2,
      2,
      PreparePreferencesRemove},
+    {"update-databases",
+     "[--types TYPES] [--wait] [--timeout SECONDS]",
+     "have the service databases brought up to date",
+     "Has the service compare the installed databases with the server's index, and install what\n"
+     "differs. The service takes the request and sends the outcome to the telephony daemon.\n"
+     "\n"
+     "  --types TYPES      names of gsm, umts, cdma, lte and scdma with commas between them, or "
+     "all\n"
+     "                     (the default), or a mask of their bits, such as 12 or 0xc\n"
+     "  --wait             ask for one type after the other, wait for each outcome in the "
+     "telephony\n"
+     "                     daemon's place, and show it. While the telephony daemon runs this "
+     "cannot\n"
+     "                     be: nothing is asked, and the exit status is 3.\n"
+     "  --timeout SECONDS  wait at most so long in all (default: 300)\n"
+     "\n"
+     "With --wait the exit status is 0 when each type was updated or needed no update, and 1 when\n"
+     "one failed or the time was over; then too the outcomes that came are shown. A type whose\n"
+     "entry in the index has no URL has no outcome at all.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper update-databases --types gsm,lte\n"
+     "  lfhelper update-databases --wait --timeout 60\n"
+     "  lfhelper update-databases --types gsm --wait --json\n",
+     0,
+     0,
+     PrepareUpdateDatabases},
     {"country-code",
      "",
      "show the country code that is configured",
