@@ -180,6 +180,7 @@ void Reset(std::uint64_t seed) {
     world.script.tasks.clear();
     ResetPorts();
     ResetProcesses();
+    ResetArchives();
     ResetFiles();
     ResetServices();
     ResetMemory();

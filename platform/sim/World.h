@@ -114,6 +114,7 @@ void NoteCall(std::string_view name, std::string_view details = {});
 void ResetMainLoop();
 void ResetQueues();
 void ResetPorts();
+void ResetArchives();
 void ResetFiles();
 void ResetProcesses();
 void ResetLogs();

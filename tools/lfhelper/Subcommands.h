@@ -22,6 +22,8 @@ struct Answer {
     JsonObject fields{};
     /// For people, when the service found nothing where it was asked to look; else empty.
     std::string absence{};
+    /// For people, when the service answered that it did not do what it was asked for; else empty.
+    std::string failure{};
 };
 
 using Request = std::function<Answer(LFMobileHelper* helper)>;

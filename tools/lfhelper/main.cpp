@@ -110,7 +110,9 @@ int Fail(const CommandLine& line, ExitStatus status, std::string_view name, std:
 ExitStatus ExitStatusOf(const Answer& answer) {
     switch (answer.code) {
         case LF_MOBILE_HELPER_SUCCESS:
-            return answer.absence.empty() ? kSuccess : kNoValue;
+            return !answer.failure.empty()  ? kFailure
+                   : answer.absence.empty() ? kSuccess
+                                            : kNoValue;
         case LF_MOBILE_HELPER_NOT_ENTITLED:
         case LF_MOBILE_HELPER_ERROR_NO_SERVICE:
         case LF_MOBILE_HELPER_ERROR_NOT_A_SERVICE:
@@ -139,8 +141,8 @@ void PrintAnswerForPeople(const Subcommand& subcommand, const Answer& answer) {
     Print(stdout, answer.text);
     const std::string name(subcommand.name);
     const std::string meaning = LFMobileHelperErrorString(answer.code);
-    if (!answer.absence.empty()) {
-        PrintError(name + ": " + answer.absence);
+    if (!answer.absence.empty() || !answer.failure.empty()) {
+        PrintError(name + ": " + answer.absence + answer.failure);
     } else if (answer.code == LF_MOBILE_HELPER_SUCCESS && answer.text.empty()) {
         Print(stdout, name + ": " + meaning + "\n");
     } else if (answer.code != LF_MOBILE_HELPER_SUCCESS) {
