@@ -184,6 +184,7 @@ void Reset(std::uint64_t seed) {
     ResetFiles();
     ResetServices();
     ResetMemory();
+    ResetHttp();
     ResetLogs();
     world.random.seed(seed);
     world.now = 0;

@@ -120,6 +120,7 @@ void ResetProcesses();
 void ResetLogs();
 void ResetServices();
 void ResetMemory();
+void ResetHttp();
 
 /// The daemon's exit sources see the exit of every process.
 void ExitAllProcesses();

@@ -22,6 +22,7 @@ constexpr const char* kMobileUser = "handlers/carrier/MobileUser.h";
 // The longest folder that a file lies in decides.
 const std::vector<Rule> kRules{
     {"platform/", {"platform/"}, {}},
+    {"platform/hvu/", {"platform/"}, {"zlib.h"}},
     {"platform/linux/", {"platform/"}, {"*"}},
     {"platform/sim/", {"platform/"}, {}},
     {"Helper/Shared/Server/", {"platform/", kHost}, kPosixFiles},
