@@ -33,8 +33,9 @@ Archives& TheArchives() {
 }  // namespace
 
 void ResetArchives() {
-    // Copiers outlive a world, as other memory of the daemon does.
-    TheArchives() = {.copiers = TheArchives().copiers};
+    Archives fresh;
+    fresh.copiers = TheArchives().copiers;  // they outlive a world, as all of our memory does
+    TheArchives() = std::move(fresh);
 }
 
 void ProvideArchive(std::string_view path, ArchiveSource source) {
