@@ -44,7 +44,8 @@ struct FileAttributes {
     std::optional<std::uint32_t> group{};
 };
 
-/// Sets what is given. The permissions of a link are EOPNOTSUPP.
+/// Sets what is given, the owner and the group first. A link has no permissions of its own: those
+/// are not set, and that is no failure.
 [[nodiscard]] int FileManagerSetAttributes(const FileAttributes& attributes,
                                            const PathAccess& item);
 

@@ -4,7 +4,6 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <array>
 #include <cerrno>
 #include <climits>
@@ -14,6 +13,8 @@
 #include "platform/Assertion.h"
 #include "platform/PropertyListXml.h"
 #include "platform/linux/OwnedFd.h"
+#include "platform/linux/ReplacementFile.h"
+#include "platform/linux/WholeFile.h"
 
 namespace platform {
 namespace {
@@ -32,31 +33,6 @@ std::string ErrorText(int error) {
 
 Contents Unusable(State state, std::string complaint) {
     return {.state = state, .complaint = std::move(complaint)};
-}
-
-/// The bytes of a file of at most the largest size, or an errno value. Files can grow while they
-/// are read.
-int ReadWhole(const OwnedFd& file, std::size_t size, std::vector<std::byte>& bytes) {
-    constexpr std::size_t kMost = kPropertyListLimits.bytes;
-    bytes.resize(size + 1);
-    std::size_t length = 0;
-    for (;;) {
-        if (length > kMost) {
-            return EFBIG;
-        }
-        if (length == bytes.size()) {
-            bytes.resize(std::min(length * 2, kMost + 1));
-        }
-        const ssize_t count = ::read(file.get(), bytes.data() + length, bytes.size() - length);
-        if (count < 0 && errno != EINTR) {
-            return errno;
-        }
-        if (count == 0) {
-            bytes.resize(length);
-            return 0;
-        }
-        length += count > 0 ? static_cast<std::size_t>(count) : 0;
-    }
 }
 
 /// Where a file really is: its folder, held open, and its name in there.
@@ -87,102 +63,6 @@ Place FinalPlace(std::string path) {
     }
     return {.folder = {}, .name = {}, .error = ELOOP};
 }
-
-/// Gathers the pieces of the text and writes them to a file.
-class Output {
-public:
-    explicit Output(const OwnedFd& file) : file_(file) { buffer_.reserve(kBufferSize); }
-
-    void put(std::string_view text) {
-        if (buffer_.size() + text.size() > kBufferSize) {
-            flush();
-        }
-        if (text.size() > kBufferSize) {
-            write(text);
-        } else {
-            buffer_ += text;
-        }
-    }
-
-    /// 0 when everything reached the disk.
-    [[nodiscard]] int finish() {
-        flush();
-        return error_ == 0 && fsync(file_.get()) != 0 ? errno : error_;
-    }
-
-private:
-    static constexpr std::size_t kBufferSize = 64U << 10;
-
-    void flush() {
-        write(buffer_);
-        buffer_.clear();
-    }
-
-    void write(std::string_view text) {
-        while (error_ == 0 && !text.empty()) {
-            const ssize_t count = ::write(file_.get(), text.data(), text.size());
-            if (count < 0 && errno != EINTR) {
-                error_ = errno;
-            }
-            text.remove_prefix(count > 0 ? static_cast<std::size_t>(count) : 0);
-        }
-    }
-
-    const OwnedFd& file_;
-    std::string buffer_;
-    int error_ = 0;
-};
-
-/// A complete new file beside the old one; goes with the object unless it took the old one's place.
-class Replacement {
-public:
-    explicit Replacement(const Place& place) : place_(place) {}
-
-    ~Replacement() {
-        if (isMade_) {
-            unlinkat(place_.folder.get(), kTemporaryName, 0);
-        }
-    }
-
-    Replacement(const Replacement&) = delete;
-    Replacement& operator=(const Replacement&) = delete;
-
-    /// Nobody can have us write through what they put there: it is removed, and made anew by us.
-    [[nodiscard]] int make(const PropertyList& entries, mode_t mode) {
-        // What stays in the way all the same fails the creation.
-        (void)unlinkat(place_.folder.get(), kTemporaryName, 0);
-        const OwnedFd file(openat(place_.folder.get(),
-                                  kTemporaryName,
-                                  O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC,
-                                  kNewMode));
-        if (!file.isOpen()) {
-            return errno;
-        }
-        isMade_ = true;
-        if (fchmod(file.get(), mode) != 0) {
-            return errno;
-        }
-        Output output(file);
-        WriteXmlPropertyList(entries, [&output](std::string_view text) { output.put(text); });
-        return output.finish();
-    }
-
-    [[nodiscard]] int takePlace() {
-        const int folder = place_.folder.get();
-        if (renameat(folder, kTemporaryName, folder, place_.name.c_str()) != 0) {
-            return errno;
-        }
-        isMade_ = false;
-        // A folder is opened for reading to be synced; where that is not allowed the rename is as
-        // sure as the file system makes it.
-        const OwnedFd readable(openat(folder, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-        return readable.isOpen() && fsync(readable.get()) != 0 ? errno : 0;
-    }
-
-private:
-    const Place& place_;
-    bool isMade_ = false;
-};
 
 /// Gives the damaged file a second name, since the new one is about to take its first. One that was
 /// kept earlier goes.
@@ -230,7 +110,10 @@ Contents PreferenceFile::read() const {
     std::vector<std::byte> bytes;
     const bool isTooLarge = status.st_size > static_cast<off_t>(kPropertyListLimits.bytes);
     const int error =
-        isTooLarge ? EFBIG : ReadWhole(file, static_cast<std::size_t>(status.st_size), bytes);
+        isTooLarge
+            ? EFBIG
+            : ReadWhole(
+                  file, static_cast<std::size_t>(status.st_size), kPropertyListLimits.bytes, bytes);
     if (error != 0) {
         return Unusable(State::kUnreadable, "cannot be read: " + ErrorText(error));
     }
@@ -251,13 +134,15 @@ std::string PreferenceFile::replace(const Contents& contents) const {
     if (place.error != 0) {
         return "cannot be written: " + ErrorText(place.error);
     }
-    Replacement replacement(place);
-    int error = replacement.make(contents.entries, ModeOf(place));
+    ReplacementFile replacement(place.folder, kTemporaryName);
+    int error = replacement.make(ModeOf(place), [&contents](const ReplacementFile::Put& put) {
+        WriteXmlPropertyList(contents.entries, put);
+    });
     if (error == 0 && contents.state == State::kDamaged) {
         error = KeepDamaged(place);
     }
     if (error == 0) {
-        error = replacement.takePlace();
+        error = replacement.takePlace(place.name);
     }
     return error == 0 ? std::string() : "cannot be written: " + ErrorText(error);
 }
