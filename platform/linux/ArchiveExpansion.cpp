@@ -3,12 +3,12 @@
 #include "platform/linux/ArchiveExpansion.h"
 
 #include <algorithm>
-#include <array>
 #include <cerrno>
 #include <cstring>
 #include <optional>
 #include <vector>
 
+#include "platform/FileManager.h"
 #include "platform/linux/ArchiveNames.h"
 #include "platform/linux/ExpandedTree.h"
 
@@ -20,12 +20,6 @@ constexpr std::uint64_t kMostBytes = std::uint64_t{1} << 30;
 /// What is left of an entry's mode: set-id and sticky bits do not come from outside, nor does the
 /// right of others to write.
 constexpr mode_t kModeMask = 0755;
-
-/// Errors of the disk or of this process: every other entry would meet them, too.
-bool ConcernsAll(int error) {
-    constexpr std::array kErrors{ENOSPC, EDQUOT, EROFS, EIO, ENOMEM, EMFILE, ENFILE};
-    return std::ranges::find(kErrors, error) != kErrors.end();
-}
 
 class Expansion {
 public:
@@ -72,7 +66,7 @@ ArchiveResult Expansion::outcomeOf(int error) {
     }
     // A link in the way is as little a folder as a file is.
     ArchiveError told{error, error == ENOTDIR ? "a file or link is in the way" : strerror(error)};
-    return ConcernsAll(error) ? end(std::move(told)) : refuse(std::move(told));
+    return ConcernsAllItems(error) ? end(std::move(told)) : refuse(std::move(told));
 }
 
 ArchiveResult Expansion::outcomeOfReading(ArchiveResult result) {

@@ -162,18 +162,22 @@ TEST_F(LfhelperTest, SaysWhenTheServiceDidNotDoIt) {
               "tells why\n");
 }
 
-TEST_F(LfhelperTest, TellsProgramsWhetherItWasDone) {
-    for (const std::int32_t done : {0, 1}) {
-        const auto outcome =
-            runAnswered("--json copy-archive source destination", NumberReply(8683571, done));
-        EXPECT_EQ(outcome.exitStatus, 1 - done);
-        EXPECT_EQ(outcome.output,
-                  "{\"command\":\"copy-archive\",\"exitStatus\":" + std::to_string(1 - done) +
-                      ",\"code\":0,\"name\":\"SUCCESS\",\"meaning\":\"success\",\"done\":" +
-                      (done != 0 ? "true" : "false") +
-                      ",\"source\":\"source\",\"destination\":\"destination\"}\n");
-        EXPECT_EQ(requestText(32) + " " + requestText(288), "source destination");
-    }
+TEST_F(LfhelperTest, TellsProgramsThatItWasNotDone) {
+    const auto outcome =
+        runAnswered("--json copy-archive source destination", NumberReply(8683571, 0));
+    EXPECT_EQ(outcome.exitStatus, 1);
+    EXPECT_EQ(outcome.output,
+              "{\"command\":\"copy-archive\",\"exitStatus\":1,\"code\":0,\"name\":\"SUCCESS\","
+              "\"meaning\":\"success\",\"done\":false,\"source\":\"source\",\"destination\":"
+              "\"destination\"}\n");
+    EXPECT_EQ(requestText(32) + " " + requestText(288), "source destination");
+}
+
+TEST_F(LfhelperTest, TellsProgramsThatItWasDone) {
+    const auto outcome = runAnswered("--json copy-log-directory source", NumberReply(8683565, 1));
+    EXPECT_EQ(outcome.exitStatus, 0);
+    EXPECT_TRUE(Contains(outcome.output, "\"done\":true,\"source\":\"source\"}"));
+    EXPECT_EQ(requestText(32), "source");
 }
 
 TEST_F(LfhelperTest, ShowsAPropertyListFile) {
