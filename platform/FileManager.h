@@ -3,8 +3,10 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <functional>
 #include <optional>
 #include <span>
+#include <string>
 #include <string_view>
 
 #include "platform/PathAccess.h"
@@ -16,18 +18,29 @@ namespace platform {
 // tree nothing but descriptors is followed: whoever exchanges folders and links meanwhile leads
 // nobody elsewhere. The call returns when the work is done, and never waits for another process.
 
+/// Asked about what cannot be copied inside a tree, by its path below the top. True: leave it out
+/// and go on. What no item can be blamed for, such as a full disk, is not asked about.
+using LeaveOutHandler = std::function<bool(const std::string& subpath, int error)>;
+
 /// Copies an item to a path where nothing is; EEXIST when something is there.
 ///
 /// The copy belongs to the process. Permissions, times, user.* attributes, holes, symbolic links
 /// (dangling ones too) and hard links inside the tree are kept; set-id bits, security.* and
 /// trusted.* attributes, access control lists and flags such as the immutable one are not. FIFOs,
-/// sockets and device nodes inside a tree are left out without a word; an item that is one is
-/// EOPNOTSUPP. A tree into itself is EINVAL.
+/// sockets and device nodes inside a tree are left out without a word, or told to the handler with
+/// EOPNOTSUPP; an item that is one is EOPNOTSUPP. A tree into itself is EINVAL. Without a handler
+/// the first failure inside a tree is that of the copy.
 ///
 /// The path shows nothing until the copy is complete: a copy that fails is removed, and one that
 /// the end of the process interrupts lies beside under a name of ours, which the next copy into
 /// that folder removes.
-[[nodiscard]] int FileManagerCopyItem(const PathAccess& source, const PathAccess& destination);
+[[nodiscard]] int FileManagerCopyItem(const PathAccess& source,
+                                      const PathAccess& destination,
+                                      const LeaveOutHandler& leavesOut = {});
+
+/// True for an errno value that no single item can be blamed for: a full or broken disk, or no more
+/// memory or descriptors.
+[[nodiscard]] bool ConcernsAllItems(int error);
 
 /// Moves an item to a path where nothing is; EEXIST when something is there. On one file system
 /// everything stays as it is. To another one the item is copied, as above, and then removed: when

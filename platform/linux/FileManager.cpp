@@ -45,12 +45,14 @@ public:
     UnfinishedCopy(const UnfinishedCopy&) = delete;
     UnfinishedCopy& operator=(const UnfinishedCopy&) = delete;
 
-    [[nodiscard]] int make(const ItemPlace& source, Folder::Identity* sourceFolder) {
+    [[nodiscard]] int make(const ItemPlace& source,
+                           Folder::Identity* sourceFolder,
+                           const LeaveOutHandler& leavesOut) {
         if (const int error = RemoveTree(folder_, name_); error != 0 && error != ENOENT) {
             return error;
         }
         isMade_ = true;
-        return CopyTree(source, {.folder = folder_, .name = name_}, sourceFolder);
+        return CopyTree(source, {.folder = folder_, .name = name_}, sourceFolder, leavesOut);
     }
 
     [[nodiscard]] int takePlace(const std::string& name) {
@@ -98,9 +100,11 @@ int LookAtEnds(const PathAccess::State& source, const PathAccess::State& destina
 
 int Copy(const PathAccess::State& source,
          const PathAccess::State& destination,
-         Folder::Identity* sourceFolder) {
+         Folder::Identity* sourceFolder,
+         const LeaveOutHandler& leavesOut = {}) {
     UnfinishedCopy copy(destination.parent);
-    const int error = copy.make({.folder = source.parent, .name = source.name}, sourceFolder);
+    const int error =
+        copy.make({.folder = source.parent, .name = source.name}, sourceFolder, leavesOut);
     return error != 0 ? error : copy.takePlace(destination.name);
 }
 
@@ -194,10 +198,12 @@ int ModeFor(const PathAccess::State& item, mode_t* mode) {
 
 }  // namespace
 
-int FileManagerCopyItem(const PathAccess& source, const PathAccess& destination) {
+int FileManagerCopyItem(const PathAccess& source,
+                        const PathAccess& destination,
+                        const LeaveOutHandler& leavesOut) {
     Folder::Identity folder;
     const int error = LookAtEnds(source.state(), destination.state());
-    return error != 0 ? error : Copy(source.state(), destination.state(), &folder);
+    return error != 0 ? error : Copy(source.state(), destination.state(), &folder, leavesOut);
 }
 
 int FileManagerMoveItem(const PathAccess& source, const PathAccess& destination) {

@@ -75,7 +75,8 @@ int HardLinks::remember(const struct stat& status, std::string path) {
 
 class TreeCopy {
 public:
-    TreeCopy(const ItemPlace& source, const ItemPlace& copy) : source_(source), copy_(copy) {}
+    TreeCopy(const ItemPlace& source, const ItemPlace& copy, const LeaveOutHandler& leavesOut)
+        : source_(source), copy_(copy), leavesOut_(leavesOut) {}
 
     int copy(Folder::Identity* sourceFolder);
 
@@ -90,6 +91,7 @@ private:
     };
 
     int copyFolders();
+    int copyFolder(const ItemPlace& source, const ItemPlace& copy);
     int enter(const ItemPlace& source, const ItemPlace& copy);
     int refuseItself(const struct stat& status);
     int copyEntries();
@@ -98,9 +100,11 @@ private:
     int copyFile(const ItemPlace& source, const ItemPlace& copy);
     int copyLink(const ItemPlace& source, const ItemPlace& copy);
     int rememberName(const struct stat& status, const std::string& name);
+    int leaveOut(const ItemPlace& copy, int error);
 
     const ItemPlace source_;
     const ItemPlace copy_;
+    const LeaveOutHandler& leavesOut_;
     std::vector<Level> levels_;
     Folder::Identity top_;  ///< of the copy
     PendingFolders pending_;
@@ -140,15 +144,24 @@ int TreeCopy::copyFolders() {
             error = finish();
         } else {
             const Level& level = levels_.back();
-            error = enter({.folder = level.source.file(), .name = name},
-                          {.folder = level.copy.file(), .name = name});
-            error = error == 0 ? copyEntries() : error;
+            error = copyFolder({.folder = level.source.file(), .name = name},
+                               {.folder = level.copy.file(), .name = name});
         }
         if (error != 0) {
             return error;
         }
     }
     return 0;
+}
+
+/// A folder that cannot be entered has no level of its own, so it can be left out.
+int TreeCopy::copyFolder(const ItemPlace& source, const ItemPlace& copy) {
+    const std::size_t depth = levels_.size();
+    const int error = enter(source, copy);
+    if (error != 0 && levels_.size() == depth) {
+        return leaveOut(copy, error);
+    }
+    return error != 0 ? error : copyEntries();
 }
 
 /// Goes down into a folder of the source and makes its copy.
@@ -200,16 +213,16 @@ int TreeCopy::refuseItself(const struct stat& status) {
 int TreeCopy::copyEntries() {
     const Level& level = levels_.back();
     std::string name;
-    return ForEachEntry(level.source.file(),
-                        [this, &level, &name](const char* found, unsigned char type) {
-                            if (type == DT_DIR) {
-                                return pending_.add(found);
-                            }
-                            name = found;
-                            return copyEntry({.folder = level.source.file(), .name = name},
-                                             {.folder = level.copy.file(), .name = name},
-                                             type);
-                        });
+    return ForEachEntry(
+        level.source.file(), [this, &level, &name](const char* found, unsigned char type) {
+            if (type == DT_DIR) {
+                return pending_.add(found);
+            }
+            name = found;
+            const ItemPlace copy{.folder = level.copy.file(), .name = name};
+            return leaveOut(copy,
+                            copyEntry({.folder = level.source.file(), .name = name}, copy, type));
+        });
 }
 
 int TreeCopy::copyEntry(const ItemPlace& source, const ItemPlace& copy, unsigned char type) {
@@ -219,7 +232,7 @@ int TreeCopy::copyEntry(const ItemPlace& source, const ItemPlace& copy, unsigned
         case DT_LNK:
             return copyLink(source, copy);
         default:
-            return 0;  // no device node, socket or FIFO comes along
+            return leavesOut_ ? EOPNOTSUPP : 0;  // no device node, socket or FIFO comes along
     }
 }
 
@@ -307,10 +320,26 @@ int TreeCopy::rememberName(const struct stat& status, const std::string& name) {
     return status.st_nlink > 1 && !levels_.empty() ? hardLinks_.remember(status, path_ + name) : 0;
 }
 
+/// 0 if whoever asked for the copy does without this item, of which nothing stays.
+int TreeCopy::leaveOut(const ItemPlace& copy, int error) {
+    if (error == 0 || !leavesOut_ || ConcernsAllItems(error) ||
+        !leavesOut_(path_ + copy.name, error)) {
+        return error;
+    }
+    const int result = unlinkat(copy.folder.get(), copy.name.c_str(), 0);
+    if (result != 0 && errno == EISDIR) {
+        (void)unlinkat(copy.folder.get(), copy.name.c_str(), AT_REMOVEDIR);
+    }
+    return 0;
+}
+
 }  // namespace
 
-int CopyTree(const ItemPlace& source, const ItemPlace& copy, Folder::Identity* sourceFolder) {
-    return TreeCopy(source, copy).copy(sourceFolder);
+int CopyTree(const ItemPlace& source,
+             const ItemPlace& copy,
+             Folder::Identity* sourceFolder,
+             const LeaveOutHandler& leavesOut) {
+    return TreeCopy(source, copy, leavesOut).copy(sourceFolder);
 }
 
 }  // namespace platform

@@ -3,6 +3,7 @@
 
 #include <string>
 
+#include "platform/FileManager.h"
 #include "platform/linux/Folder.h"
 
 namespace platform {
@@ -14,9 +15,11 @@ struct ItemPlace {
 };
 
 /// Copies to a name that is free; what a failure leaves there is for the caller to remove.
-/// `*sourceFolder` becomes the identity of a source that is a folder. 0 or an errno value.
+/// `*sourceFolder` becomes the identity of a source that is a folder. 0 or an errno
+/// value.
 [[nodiscard]] int CopyTree(const ItemPlace& source,
                            const ItemPlace& copy,
-                           Folder::Identity* sourceFolder);
+                           Folder::Identity* sourceFolder,
+                           const LeaveOutHandler& leavesOut);
 
 }  // namespace platform

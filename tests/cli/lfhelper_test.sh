@@ -44,8 +44,8 @@ says out 'Usage: lfhelper'
 says out 'Examples:'
 silent err
 for command in check-in link-carrier-bundle create-symlink remove-preference-domain \
-    'preferences get' 'preferences set' 'preferences remove' heartbeat country-code civic-address \
-    wan-ip raw; do
+    'preferences get' 'preferences set' 'preferences remove' copy-file copy-log-directory \
+    move-directory copy-archive load-plist heartbeat country-code civic-address wan-ip raw; do
     expect 0 --help
     says out "  $command "
     # shellcheck disable=SC2086 # a command of two words is two arguments
