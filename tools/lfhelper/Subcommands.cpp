@@ -142,8 +142,6 @@ Preparation PrepareRaw(const CommandLine& line) {
 }
 
 constexpr auto kSubcommands = std::to_array<Subcommand>({
-constexpr std::array<Subcommand, 12> kSubcommands{{
-constexpr std::array<Subcommand, 13> kSubcommands{{
     {"check-in",
      "",
      "ask whether the service is there and takes this caller",
