@@ -1,9 +1,12 @@
 // What the HTTP client makes of answers, the strange ones included. Runs in a private phone root.
 #include <gtest/gtest.h>
 
+#include <filesystem>
+
 #include "platform/hvu/Gzip_test.h"
 #include "tests/http/Fetch.h"
 #include "tests/http/RawServer.h"
+#include "tests/support/PhoneRoot.h"
 
 namespace {
 
@@ -175,6 +178,23 @@ TEST(HttpAnswers, DoNotTakeTrailersForHeaders) {
 TEST(HttpAnswers, MissWhenNobodyListens) {
     EXPECT_EQ(ErrorOf("http://127.0.0.1:1/"), ErrorType::kCannotConnect);
     EXPECT_EQ(ErrorOf("http://nobody.vendra.example/"), ErrorType::kHostNotFound);
+}
+
+std::size_t EntriesOf(const char* folder) {
+    const std::filesystem::directory_iterator entries(folder);
+    return static_cast<std::size_t>(std::distance(begin(entries), end(entries)));
+}
+
+TEST(HttpAnswers, LeaveNoThreadsAndDescriptorsBehind) {
+    const RawServer server(Say(Answer("", "x")));
+    EXPECT_EQ(Get(server.url()).status, 200);
+    const std::size_t descriptors = EntriesOf("/proc/self/fd");
+    for (int i = 0; i < 20; ++i) {
+        EXPECT_EQ(Get(server.url()).status, 200);
+    }
+    // This thread and the server's; what served the requests is about to end.
+    EXPECT_TRUE(phone::Eventually([] { return EntriesOf("/proc/self/task") == 2; }));
+    EXPECT_LE(EntriesOf("/proc/self/fd"), descriptors);
 }
 
 // Redirects.
