@@ -7,6 +7,8 @@
 #include <sched.h>
 #include <sys/socket.h>
 
+#include <array>
+#include <cctype>
 #include <cstdlib>
 
 namespace web {
@@ -19,7 +21,7 @@ bool IsReady(int socket, short events, int milliseconds) {
     return poll(&entry, 1, milliseconds) == 1 && (entry.revents & events) != 0;
 }
 
-/// Everything up to the empty line.
+/// Everything up to the empty line; of what does not begin with a letter, the first byte.
 std::string ReadRequest(int socket, const std::atomic<bool>& isStopping) {
     std::string request;
     while (!isStopping && request.find("\r\n\r\n") == std::string::npos) {
@@ -31,6 +33,9 @@ std::string ReadRequest(int socket, const std::atomic<bool>& isStopping) {
             break;
         }
         request.push_back(byte);
+        if (std::isalpha(static_cast<unsigned char>(request.front())) == 0) {
+            break;
+        }
     }
     return request;
 }
@@ -79,9 +84,10 @@ bool RawConnection::send(std::string_view bytes) const {
 }
 
 void RawConnection::pause(int milliseconds) const {
-    // A client has nothing more to say: what arrives is its end.
+    std::array<char, 4096> ignored{};
     for (; milliseconds > 0 && !isStopping_; milliseconds -= kTickMs) {
-        if (IsReady(socket_, POLLIN, kTickMs)) {
+        if (IsReady(socket_, POLLIN, kTickMs) &&
+            recv(socket_, ignored.data(), ignored.size(), 0) <= 0) {
             return;
         }
     }

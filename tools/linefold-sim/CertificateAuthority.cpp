@@ -66,7 +66,8 @@ std::optional<CertificateAuthority> CertificateAuthority::create(std::string fol
         (void)std::fputs("linefold-sim: openssl cannot make the certificates\n", stderr);
         return std::nullopt;
     }
-    if (flaw != Flaw::kUnknownAuthority && !authority.enterBundle()) {
+    const bool isKnown = flaw != Flaw::kUnknownAuthority && flaw != Flaw::kSelfSigned;
+    if (isKnown && !authority.enterBundle()) {
         (void)std::fprintf(stderr, "linefold-sim: cannot add to %s\n", kBundle);
         return std::nullopt;
     }
@@ -87,10 +88,8 @@ bool CertificateAuthority::makeCertificates(const std::string& host, Flaw flaw) 
     const std::string name = flaw == Flaw::kOtherHost ? "other." + host : host;
     const Command alternatives{"-addext", "subjectAltName=DNS:" + name};
     if (flaw == Flaw::kSelfSigned) {
-        return Run(With(
-                   With(Request(key(), certificate(), name), alternatives),
-                   {"-x509", "-days", "2", "-addext", "basicConstraints=critical,CA:FALSE"})) &&
-               Run({"cp", certificate(), folder_ + "/authority.crt"});
+        return Run(With(With(Request(key(), certificate(), name), alternatives),
+                        {"-x509", "-days", "2", "-addext", "basicConstraints=critical,CA:FALSE"}));
     }
     const std::string authority = folder_ + "/authority.crt";
     const std::string authorityKey = folder_ + "/authority.key";

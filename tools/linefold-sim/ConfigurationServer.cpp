@@ -159,7 +159,7 @@ std::string Configuration(const Options& options,
                           const std::string& work,
                           const CertificateAuthority& authority) {
     std::string text =
-        "daemon off;\nmaster_process off;\nuser root;\nerror_log stderr error;\n"
+        "daemon off;\nmaster_process off;\nuser root;\nerror_log stderr crit;\n"
         "pid " +
         work +
         "/pid;\nevents { worker_connections 128; }\nhttp {\n"

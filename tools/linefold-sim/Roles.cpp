@@ -15,9 +15,18 @@ std::span<const Role> Roles() {
          .summary = "serve a folder as the index server does, over HTTPS",
          .help = kConfigurationServerHelp,
          .play = &PlayConfigurationServer},
-        {"geocoder", "a geocoding server", kGeocoderHelp, PlayGeocoder},
-        {"stun", "a STUN server", kStunHelp, PlayStun},
-        {"telephony", "the telephony daemon", kTelephonyHelp, PlayTelephony},
+        {.name = "geocoder",
+         .summary = "tell the address of a place, by HTTP",
+         .help = kGeocoderHelp,
+         .play = &PlayGeocoder},
+        {.name = "stun",
+         .summary = "tell who asks under which address he is seen",
+         .help = kStunHelp,
+         .play = &PlayStun},
+        {.name = "telephony",
+         .summary = "own the telephony daemon's ports and print what arrives",
+         .help = kTelephonyHelp,
+         .play = &PlayTelephony},
     };
     return roles;
 }
