@@ -215,7 +215,7 @@ const std::array<std::vector<std::int32_t>, 24> kDocumentedCodes{{
 // clang-format on
 /// Of the routines that this build does not have.
 constexpr std::int32_t kNotSupported = 46;
-constexpr std::array kMissing{13, 14, 15, 16, 17, 22, 23};
+constexpr std::array kMissing{15, 16, 17, 22, 23};
 
 bool IsDocumentedCode(const RoutineLayout& layout, std::int32_t code) {
     const int number = layout.id - 8683549;
