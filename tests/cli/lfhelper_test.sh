@@ -44,7 +44,8 @@ says out 'Usage: lfhelper'
 says out 'Examples:'
 silent err
 for command in check-in link-carrier-bundle create-symlink remove-preference-domain \
-    'preferences get' 'preferences set' 'preferences remove' country-code civic-address wan-ip raw; do
+    'preferences get' 'preferences set' 'preferences remove' copy-file copy-log-directory \
+    move-directory copy-archive load-plist heartbeat country-code civic-address wan-ip raw; do
     expect 0 --help
     says out "  $command "
     # shellcheck disable=SC2086 # a command of two words is two arguments
@@ -102,6 +103,8 @@ done
 usage 'preferences is not the whole command' preferences
 says err 'Try: lfhelper preferences --help'
 usage 'there is no command preferences nonsense' preferences nonsense
+usage 'STATE must be on or off, not "maybe"' heartbeat maybe
+usage 'too few arguments for heartbeat' heartbeat
 usage 'too few arguments for preferences get' preferences get domain
 usage 'too many arguments for preferences get' preferences get domain key value
 usage 'too few arguments for preferences set' preferences set domain key

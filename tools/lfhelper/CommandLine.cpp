@@ -12,7 +12,7 @@ struct KnownOption {
     std::string_view name;
     Takes takes;
     /// The commands that it belongs to; none for all.
-    std::array<std::string_view, 2> commands{};
+    std::array<std::string_view, 3> commands{};
 
     [[nodiscard]] bool belongsTo(std::string_view command) const {
         return commands[0].empty() || std::ranges::find(commands, command) != commands.end();
@@ -27,7 +27,7 @@ struct KnownOption {
     }
 };
 
-constexpr std::array<KnownOption, 11> kKnownOptions{{
+constexpr std::array<KnownOption, 13> kKnownOptions{{
     {"help", Takes::kNothing},
     {"version", Takes::kNothing},
     {"json", Takes::kNothing},
@@ -38,7 +38,9 @@ constexpr std::array<KnownOption, 11> kKnownOptions{{
     {"application", Takes::kNothing, {"preferences get"}},
     {"plist", Takes::kNothing, {"preferences get"}},
     {"type", Takes::kValue, {"preferences set"}},
-    {"wait", Takes::kNothing, {"civic-address", "wan-ip"}},
+    {"types", Takes::kValue, {"update-databases"}},
+    {"timeout", Takes::kValue, {"update-databases"}},
+    {"wait", Takes::kNothing, {"update-databases", "civic-address", "wan-ip"}},
 }};
 
 /// The first word of commands that have two.

@@ -11,9 +11,11 @@
 
 #include "Helper/Shared/Server/MessageLayouts.h"
 #include "tools/lfhelper/HeartbeatCommands.h"
+#include "tools/lfhelper/FileCommands.h"
 #include "tools/lfhelper/HexDump.h"
 #include "tools/lfhelper/LocationCommands.h"
 #include "tools/lfhelper/PreferenceCommands.h"
+#include "tools/lfhelper/UpdateCommands.h"
 
 namespace lfhelper {
 namespace {
@@ -243,6 +245,33 @@ constexpr auto kSubcommands = std::to_array<Subcommand>({
      2,
      2,
      PreparePreferencesRemove},
+    {"update-databases",
+     "[--types TYPES] [--wait] [--timeout SECONDS]",
+     "have the service databases brought up to date",
+     "Has the service compare the installed databases with the server's index, and install what\n"
+     "differs. The service takes the request and sends the outcome to the telephony daemon.\n"
+     "\n"
+     "  --types TYPES      names of gsm, umts, cdma, lte and scdma with commas between them, or "
+     "all\n"
+     "                     (the default), or a mask of their bits, such as 12 or 0xc\n"
+     "  --wait             ask for one type after the other, wait for each outcome in the "
+     "telephony\n"
+     "                     daemon's place, and show it. While the telephony daemon runs this "
+     "cannot\n"
+     "                     be: nothing is asked, and the exit status is 3.\n"
+     "  --timeout SECONDS  wait at most so long in all (default: 300)\n"
+     "\n"
+     "With --wait the exit status is 0 when each type was updated or needed no update, and 1 when\n"
+     "one failed or the time was over; then too the outcomes that came are shown. A type whose\n"
+     "entry in the index has no URL has no outcome at all.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper update-databases --types gsm,lte\n"
+     "  lfhelper update-databases --wait --timeout 60\n"
+     "  lfhelper update-databases --types gsm --wait --json\n",
+     0,
+     0,
+     PrepareUpdateDatabases},
     {"country-code",
      "",
      "show the country code that is configured",
@@ -314,6 +343,77 @@ constexpr auto kSubcommands = std::to_array<Subcommand>({
      1,
      1,
      PrepareHeartbeat},
+    {"copy-file",
+     "SOURCE-DIRECTORY DESTINATION-DIRECTORY NAME",
+     "copy a file into a carrier-bundle directory",
+     "Copies SOURCE-DIRECTORY/NAME to DESTINATION-DIRECTORY/NAME, which must be a carrier path, "
+     "and\n"
+     "gives it to the mobile user. The destination directory is made if it is missing.\n"
+     "\n"
+     "When the service did not do it the exit status is 1; its log tells why.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper copy-file /tmp '/private/var/mobile/Library/Carrier Bundles' Example.plist\n",
+     3,
+     3,
+     PrepareCopyFile},
+    {"copy-log-directory",
+     "SOURCE",
+     "copy logs into the crash-report folder",
+     "Copies a file or directory into Library/Logs/CrashReporter of the mobile user.\n"
+     "\n"
+     "When the service did not do it the exit status is 1; its log tells why.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper copy-log-directory /private/var/tmp/baseband-logs\n",
+     1,
+     1,
+     PrepareCopyLogDirectory},
+    {"move-directory",
+     "SOURCE DESTINATION-DIRECTORY NAME",
+     "move a directory into a carrier-bundle directory",
+     "Moves SOURCE to DESTINATION-DIRECTORY/NAME, which must be a carrier path where nothing is. "
+     "The\n"
+     "destination directory is made if it is missing, also when the path is refused.\n"
+     "\n"
+     "When the service did not do it the exit status is 1; its log tells why.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper move-directory /private/var/tmp/Example.bundle \\\n"
+     "      '/private/var/mobile/Library/Carrier Bundles' Example.bundle\n",
+     3,
+     3,
+     PrepareMoveDirectory},
+    {"copy-archive",
+     "SOURCE DESTINATION",
+     "expand a ZIP archive, or copy anything else",
+     "Expands SOURCE into the directory DESTINATION if its first bytes are those of a ZIP "
+     "archive;\n"
+     "otherwise copies it: what a directory contains goes into DESTINATION, a file to DESTINATION "
+     "or\n"
+     "inside it. A directory DESTINATION is made if it is missing.\n"
+     "\n"
+     "Files that the service had to leave out are told in its log and change nothing else. When "
+     "it\n"
+     "had to stop, what was made until then stays, and the exit status is 1; its log tells why.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper copy-archive /tmp/Example.crbn /private/var/tmp/Example\n",
+     2,
+     2,
+     PrepareCopyArchive},
+    {"load-plist",
+     "PATH",
+     "show a property-list file",
+     "Writes the dictionary in the file PATH to standard output, as an XML property list. With "
+     "--json\n"
+     "it stands in \"plist\".\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper load-plist '/private/var/mobile/Library/Carrier Bundle.bundle/Info.plist'\n",
+     1,
+     1,
+     PrepareLoadPlist},
     {"raw",
      "[--complex] [--claim-size N] ID [HEX]",
      "send a message as it is, and show the reply field by field",
