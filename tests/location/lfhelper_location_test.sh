@@ -101,7 +101,7 @@ state: England
 city: Stoke \"upon\" Trent
 postal code: "
 exits 0 --json civic-address --wait 53.0 -2.18
-json '.CountryCode == "GB" and .PostalCode == "" and .City == "Stoke \"upon\" Trent"'
+json '.countryCode == "GB" and .postalCode == "" and .state == "England" and .city == "Stoke \"upon\" Trent"'
 line /tmp/geocoder 'GET /reverse?format=jsonv2&lat=53.0000000&lon=-2.1800000&zoom=18&addressdetails=1&accept-language=en HTTP/1.1'
 exits 0 civic-address --wait 0 0
 prints "country code: US
@@ -111,7 +111,7 @@ postal code: "
 exits 0 wan-ip --wait
 prints 'address: 198.51.100.2'
 exits 0 --json wan-ip --wait
-json '.Address == "198.51.100.2" and .code == 0'
+json '.address == "198.51.100.2" and .code == 0'
 [ ! -e "$socket" ] || fail "lfhelper leaves its port behind"
 
 # ---- Nothing is asked while the telephony daemon is there
