@@ -284,7 +284,8 @@ LF_MOBILE_HELPER_EXPORT int32_t LFMobileHelperCopyCountryCode(
 /* Looks up the public address of the device and reports it to the telephony daemon. */
 LF_MOBILE_HELPER_EXPORT int32_t LFMobileHelperRequestWanIPFromLocation(LFMobileHelper* helper);
 
-/* Starts (other than 0) or stops (0) the heartbeat on the cellular interface. */
+/* Starts (other than 0) or stops (0) the heartbeat on the cellular interface. It outlives the client
+ * and keeps the service alive until it is stopped; started twice, it keeps it for good. */
 LF_MOBILE_HELPER_EXPORT int32_t LFMobileHelperSetHeartbeatEnabled(LFMobileHelper* helper,
                                                                   int32_t isEnabled);
 

@@ -2,62 +2,18 @@
 
 #include <fcntl.h>
 #include <sys/stat.h>
-#include <unistd.h>
 
-#include <algorithm>
 #include <array>
 #include <cerrno>
 #include <climits>
 #include <cstring>
-#include <optional>
 
-#include "platform/Assertion.h"
-#include "platform/PropertyListXml.h"
 #include "platform/linux/OwnedFd.h"
 
 namespace platform {
 namespace {
 
-using Contents = PreferenceFile::Contents;
-using State = PreferenceFile::State;
-
-/// One name for all domains: whatever a crash leaves behind, the next write removes.
-constexpr const char* kTemporaryName = ".linefold-mobile-helper.tmp";
-constexpr mode_t kNewMode = S_IRUSR | S_IWUSR;
 constexpr int kMaxLinks = 40;
-
-std::string ErrorText(int error) {
-    return strerrordesc_np(error);
-}
-
-Contents Unusable(State state, std::string complaint) {
-    return {.state = state, .complaint = std::move(complaint)};
-}
-
-/// The bytes of a file of at most the largest size, or an errno value. Files can grow while they
-/// are read.
-int ReadWhole(const OwnedFd& file, std::size_t size, std::vector<std::byte>& bytes) {
-    constexpr std::size_t kMost = kPropertyListLimits.bytes;
-    bytes.resize(size + 1);
-    std::size_t length = 0;
-    for (;;) {
-        if (length > kMost) {
-            return EFBIG;
-        }
-        if (length == bytes.size()) {
-            bytes.resize(std::min(length * 2, kMost + 1));
-        }
-        const ssize_t count = ::read(file.get(), bytes.data() + length, bytes.size() - length);
-        if (count < 0 && errno != EINTR) {
-            return errno;
-        }
-        if (count == 0) {
-            bytes.resize(length);
-            return 0;
-        }
-        length += count > 0 ? static_cast<std::size_t>(count) : 0;
-    }
-}
 
 /// Where a file really is: its folder, held open, and its name in there.
 struct Place {
@@ -88,119 +44,8 @@ Place FinalPlace(std::string path) {
     return {.folder = {}, .name = {}, .error = ELOOP};
 }
 
-/// Gathers the pieces of the text and writes them to a file.
-class Output {
-public:
-    explicit Output(const OwnedFd& file) : file_(file) { buffer_.reserve(kBufferSize); }
-
-    void put(std::string_view text) {
-        if (buffer_.size() + text.size() > kBufferSize) {
-            flush();
-        }
-        if (text.size() > kBufferSize) {
-            write(text);
-        } else {
-            buffer_ += text;
-        }
-    }
-
-    /// 0 when everything reached the disk.
-    [[nodiscard]] int finish() {
-        flush();
-        return error_ == 0 && fsync(file_.get()) != 0 ? errno : error_;
-    }
-
-private:
-    static constexpr std::size_t kBufferSize = 64U << 10;
-
-    void flush() {
-        write(buffer_);
-        buffer_.clear();
-    }
-
-    void write(std::string_view text) {
-        while (error_ == 0 && !text.empty()) {
-            const ssize_t count = ::write(file_.get(), text.data(), text.size());
-            if (count < 0 && errno != EINTR) {
-                error_ = errno;
-            }
-            text.remove_prefix(count > 0 ? static_cast<std::size_t>(count) : 0);
-        }
-    }
-
-    const OwnedFd& file_;
-    std::string buffer_;
-    int error_ = 0;
-};
-
-/// A complete new file beside the old one; goes with the object unless it took the old one's place.
-class Replacement {
-public:
-    explicit Replacement(const Place& place) : place_(place) {}
-
-    ~Replacement() {
-        if (isMade_) {
-            unlinkat(place_.folder.get(), kTemporaryName, 0);
-        }
-    }
-
-    Replacement(const Replacement&) = delete;
-    Replacement& operator=(const Replacement&) = delete;
-
-    /// Nobody can have us write through what they put there: it is removed, and made anew by us.
-    [[nodiscard]] int make(const PropertyList& entries, mode_t mode) {
-        // What stays in the way all the same fails the creation.
-        (void)unlinkat(place_.folder.get(), kTemporaryName, 0);
-        const OwnedFd file(openat(place_.folder.get(),
-                                  kTemporaryName,
-                                  O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC,
-                                  kNewMode));
-        if (!file.isOpen()) {
-            return errno;
-        }
-        isMade_ = true;
-        if (fchmod(file.get(), mode) != 0) {
-            return errno;
-        }
-        Output output(file);
-        WriteXmlPropertyList(entries, [&output](std::string_view text) { output.put(text); });
-        return output.finish();
-    }
-
-    [[nodiscard]] int takePlace() {
-        const int folder = place_.folder.get();
-        if (renameat(folder, kTemporaryName, folder, place_.name.c_str()) != 0) {
-            return errno;
-        }
-        isMade_ = false;
-        // A folder is opened for reading to be synced; where that is not allowed the rename is as
-        // sure as the file system makes it.
-        const OwnedFd readable(openat(folder, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-        return readable.isOpen() && fsync(readable.get()) != 0 ? errno : 0;
-    }
-
-private:
-    const Place& place_;
-    bool isMade_ = false;
-};
-
-/// Gives the damaged file a second name, since the new one is about to take its first. One that was
-/// kept earlier goes.
-int KeepDamaged(const Place& place) {
-    const int folder = place.folder.get();
-    const std::string kept = place.name + ".damaged";
-    if (unlinkat(folder, kept.c_str(), 0) != 0 && errno != ENOENT) {
-        return errno;
-    }
-    if (linkat(folder, place.name.c_str(), folder, kept.c_str(), 0) == 0) {
-        return 0;
-    }
-    // Where it may not have two names, as a file of somebody else's, it changes its one. Should the
-    // system stop now, the domain is empty, as it was.
-    return renameat(folder, place.name.c_str(), folder, kept.c_str()) == 0 ? 0 : errno;
-}
-
 mode_t ModeOf(const Place& place) {
+    constexpr mode_t kNewMode = S_IRUSR | S_IWUSR;
     constexpr mode_t kPermissions = S_IRWXU | S_IRWXG | S_IRWXO;
 
     struct stat status {};
@@ -213,53 +58,15 @@ mode_t ModeOf(const Place& place) {
 
 }  // namespace
 
-Contents PreferenceFile::read() const {
-    // Whatever it is, opening it must not wait: a FIFO without a writer would hold us for ever.
-    const OwnedFd file(open(path_.c_str(), O_RDONLY | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
-    if (!file.isOpen()) {
-        return errno == ENOENT
-                   ? Contents()
-                   : Unusable(State::kUnreadable, "cannot be read: " + ErrorText(errno));
-    }
-
-    struct stat status {};
-
-    if (fstat(file.get(), &status) != 0 || !S_ISREG(status.st_mode)) {
-        return Unusable(State::kUnreadable, "is not a regular file");
-    }
-    std::vector<std::byte> bytes;
-    const bool isTooLarge = status.st_size > static_cast<off_t>(kPropertyListLimits.bytes);
-    const int error =
-        isTooLarge ? EFBIG : ReadWhole(file, static_cast<std::size_t>(status.st_size), bytes);
-    if (error != 0) {
-        return Unusable(State::kUnreadable, "cannot be read: " + ErrorText(error));
-    }
-    auto entries = PropertyListCreateWithData(bytes);
-    if (!entries || entries->kind() != PropertyList::Kind::kDictionary) {
-        return Unusable(State::kDamaged, "is damaged: it holds no property list with a dictionary");
-    }
-    return {.state = State::kRead, .entries = std::move(*entries), .fileSize = bytes.size()};
+PreferenceFile::Contents PreferenceFile::read() const {
+    return PropertyListFile(AT_FDCWD, path_).read(PropertyListFile::Links::kFollowed);
 }
 
 std::string PreferenceFile::replace(const Contents& contents) const {
-    PLATFORM_ASSERT(contents.state != State::kUnreadable);
-    if (!XmlPropertyListSize(contents.entries)) {
-        return "cannot be written: it would hold more than 16 MiB or 200,000 objects, or "
-               "characters that XML cannot hold";
-    }
     const Place place = FinalPlace(path_);
-    if (place.error != 0) {
-        return "cannot be written: " + ErrorText(place.error);
-    }
-    Replacement replacement(place);
-    int error = replacement.make(contents.entries, ModeOf(place));
-    if (error == 0 && contents.state == State::kDamaged) {
-        error = KeepDamaged(place);
-    }
-    if (error == 0) {
-        error = replacement.takePlace();
-    }
-    return error == 0 ? std::string() : "cannot be written: " + ErrorText(error);
+    return place.error == 0
+               ? PropertyListFile(place.folder.get(), place.name).replace(contents, ModeOf(place))
+               : std::string("cannot be written: ") + strerrordesc_np(place.error);
 }
 
 }  // namespace platform

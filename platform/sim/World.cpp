@@ -180,7 +180,12 @@ void Reset(std::uint64_t seed) {
     world.script.tasks.clear();
     ResetPorts();
     ResetProcesses();
+    ResetEcho();
+    ResetArchives();
     ResetFiles();
+    ResetLibraries();
+    ResetMailbox();
+    ResetRadioManager();
     ResetServices();
     ResetGeocoding();
     ResetTelephony();

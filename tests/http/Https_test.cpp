@@ -3,10 +3,12 @@
 
 #include <fstream>
 
+#include "lasd/HttpFetcher.h"
 #include "platform/hvu/Gzip_test.h"
 #include "tests/http/ConfigurationServer.h"
 #include "tests/http/Fetch.h"
 #include "tests/http/RawServer.h"
+#include "tests/support/PhoneRoot.h"
 
 namespace {
 
@@ -18,9 +20,13 @@ using web::Get;
 
 const std::string kOrigin = ConfigurationServer::kOrigin;
 
-std::string Bundle() {
-    std::ifstream file("/etc/ssl/certs/ca-certificates.crt", std::ios::binary);
+std::string Read(const char* path) {
+    std::ifstream file(path, std::ios::binary);
     return {std::istreambuf_iterator<char>(file), {}};
+}
+
+std::string Bundle() {
+    return Read("/etc/ssl/certs/ca-certificates.crt");
 }
 
 TEST(Https, BringsTheIndexDecodedAndADatabaseAsItIs) {
@@ -91,6 +97,51 @@ TEST(Https, IsEnteredByARedirectAndThenNotLeft) {
     server.put("file", "there");
     EXPECT_EQ(Get(plain.url("/file")).body, "there");
     EXPECT_EQ(ErrorOf(plain.url("/in")), ErrorType::kRedirectRefused);
+}
+
+// The fetcher of the updater, which waits on its own queue's thread as the updater does.
+
+constexpr const char* kFile = "/var/mobile/Library/gsm.db.tmp";
+
+TEST(HttpFetcher, WritesADatabaseUncompressed) {
+    phone::ResetMobileHome();
+    const std::string rows(300'000, 'r');
+    ConfigurationServer server;
+    server.put("gsm.db.gz", Gzip(rows) + Gzip("last"));
+    auto log = phone::LogReader::journal();
+    HttpFetcher fetcher;
+    ASSERT_TRUE(fetcher.fetch(kOrigin + "/gsm.db.gz", Networks::kWifiOnly));
+    ASSERT_TRUE(fetcher.writeUncompressed(kFile));
+    EXPECT_TRUE(Read(kFile) == rows + "last");
+    const std::string url = kOrigin + "/gsm.db.gz";
+    EXPECT_EQ(log.take(),
+              (std::vector<std::string>{"6 - Fetching URL " + url,
+                                        "6 - URL retrieved " + url + ", size: " +
+                                            std::to_string(fetcher.body().size()) + " "}));
+}
+
+TEST(HttpFetcher, LeavesNothingOfADatabaseThatIsDamaged) {
+    phone::ResetMobileHome();
+    ConfigurationServer server;
+    server.put("gsm.db.gz", Gzip(std::string(300'000, 'r')) + "tail");
+    HttpFetcher fetcher;
+    ASSERT_TRUE(fetcher.fetch(kOrigin + "/gsm.db.gz", Networks::kWifiOnly));
+    EXPECT_FALSE(fetcher.writeUncompressed(kFile));
+    EXPECT_FALSE(std::filesystem::exists(kFile));
+}
+
+TEST(HttpFetcher, TellsWhyAServerIsNotTrusted) {
+    ConfigurationServer server({"--certificate", "expired"});
+    auto log = phone::LogReader::journal();
+    HttpFetcher fetcher;
+    EXPECT_FALSE(fetcher.fetch(kOrigin + "/x", Networks::kWifiOnly));
+    const auto lines = log.take();
+    ASSERT_EQ(lines.size(), 3U);
+    EXPECT_EQ(lines[1],
+              "5 platform " + kOrigin + "/x: SSL certificate problem: certificate has expired");
+    EXPECT_EQ(lines[2],
+              "3 - HTTP request failed for URL " + kOrigin +
+                  "/x with error server not trusted errorcode 0 (no status)");
 }
 
 }  // namespace

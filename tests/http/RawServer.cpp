@@ -7,6 +7,7 @@
 #include <sched.h>
 #include <sys/socket.h>
 
+#include <array>
 #include <cctype>
 #include <cstdlib>
 
@@ -83,9 +84,10 @@ bool RawConnection::send(std::string_view bytes) const {
 }
 
 void RawConnection::pause(int milliseconds) const {
-    // A client has nothing more to say: what arrives is its end.
+    std::array<char, 4096> ignored{};
     for (; milliseconds > 0 && !isStopping_; milliseconds -= kTickMs) {
-        if (IsReady(socket_, POLLIN, kTickMs)) {
+        if (IsReady(socket_, POLLIN, kTickMs) &&
+            recv(socket_, ignored.data(), ignored.size(), 0) <= 0) {
             return;
         }
     }

@@ -10,6 +10,8 @@
 #include <vector>
 
 #include "Helper/Shared/Server/MessageLayouts.h"
+#include "tools/lfhelper/HeartbeatCommands.h"
+#include "tools/lfhelper/FileCommands.h"
 #include "tools/lfhelper/HexDump.h"
 #include "tools/lfhelper/LocationCommands.h"
 #include "tools/lfhelper/PreferenceCommands.h"
@@ -139,7 +141,9 @@ Preparation PrepareRaw(const CommandLine& line) {
     return {.request = [message](LFMobileHelper* helper) { return SendAndDump(helper, message); }};
 }
 
+constexpr auto kSubcommands = std::to_array<Subcommand>({
 constexpr std::array<Subcommand, 12> kSubcommands{{
+constexpr std::array<Subcommand, 13> kSubcommands{{
     {"check-in",
      "",
      "ask whether the service is there and takes this caller",
@@ -319,6 +323,99 @@ constexpr std::array<Subcommand, 12> kSubcommands{{
      0,
      0,
      PrepareWanIp},
+    {"heartbeat",
+     "STATE",
+     "start or stop the echo requests over the cellular interface",
+     "With STATE \"on\" the service sends an echo request over pdp_ip0 at once and then every two\n"
+     "seconds, over whatever interface leads to its host while there is no pdp_ip0, until STATE "
+     "is\n"
+     "\"off\". It answers at once; what becomes of the requests is not told anywhere.\n"
+     "\n"
+     "A heartbeat belongs to the service and not to the caller: it goes on when this command "
+     "ends,\n"
+     "and keeps the service from leaving. \"off\" ends that, whoever says it. Each \"on\" while "
+     "it is\n"
+     "on begins the rhythm anew, and keeps the service for good: then it ends when it is told to "
+     "end\n"
+     "(SIGTERM), and no more by itself. \"off\" while it is off changes nothing.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper heartbeat on\n"
+     "  lfhelper heartbeat off\n",
+     1,
+     1,
+     PrepareHeartbeat},
+    {"copy-file",
+     "SOURCE-DIRECTORY DESTINATION-DIRECTORY NAME",
+     "copy a file into a carrier-bundle directory",
+     "Copies SOURCE-DIRECTORY/NAME to DESTINATION-DIRECTORY/NAME, which must be a carrier path, "
+     "and\n"
+     "gives it to the mobile user. The destination directory is made if it is missing.\n"
+     "\n"
+     "When the service did not do it the exit status is 1; its log tells why.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper copy-file /tmp '/private/var/mobile/Library/Carrier Bundles' Example.plist\n",
+     3,
+     3,
+     PrepareCopyFile},
+    {"copy-log-directory",
+     "SOURCE",
+     "copy logs into the crash-report folder",
+     "Copies a file or directory into Library/Logs/CrashReporter of the mobile user.\n"
+     "\n"
+     "When the service did not do it the exit status is 1; its log tells why.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper copy-log-directory /private/var/tmp/baseband-logs\n",
+     1,
+     1,
+     PrepareCopyLogDirectory},
+    {"move-directory",
+     "SOURCE DESTINATION-DIRECTORY NAME",
+     "move a directory into a carrier-bundle directory",
+     "Moves SOURCE to DESTINATION-DIRECTORY/NAME, which must be a carrier path where nothing is. "
+     "The\n"
+     "destination directory is made if it is missing, also when the path is refused.\n"
+     "\n"
+     "When the service did not do it the exit status is 1; its log tells why.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper move-directory /private/var/tmp/Example.bundle \\\n"
+     "      '/private/var/mobile/Library/Carrier Bundles' Example.bundle\n",
+     3,
+     3,
+     PrepareMoveDirectory},
+    {"copy-archive",
+     "SOURCE DESTINATION",
+     "expand a ZIP archive, or copy anything else",
+     "Expands SOURCE into the directory DESTINATION if its first bytes are those of a ZIP "
+     "archive;\n"
+     "otherwise copies it: what a directory contains goes into DESTINATION, a file to DESTINATION "
+     "or\n"
+     "inside it. A directory DESTINATION is made if it is missing.\n"
+     "\n"
+     "Files that the service had to leave out are told in its log and change nothing else. When "
+     "it\n"
+     "had to stop, what was made until then stays, and the exit status is 1; its log tells why.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper copy-archive /tmp/Example.crbn /private/var/tmp/Example\n",
+     2,
+     2,
+     PrepareCopyArchive},
+    {"load-plist",
+     "PATH",
+     "show a property-list file",
+     "Writes the dictionary in the file PATH to standard output, as an XML property list. With "
+     "--json\n"
+     "it stands in \"plist\".\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper load-plist '/private/var/mobile/Library/Carrier Bundle.bundle/Info.plist'\n",
+     1,
+     1,
+     PrepareLoadPlist},
     {"raw",
      "[--complex] [--claim-size N] ID [HEX]",
      "send a message as it is, and show the reply field by field",
@@ -337,7 +434,7 @@ constexpr std::array<Subcommand, 12> kSubcommands{{
      1,
      2,
      PrepareRaw},
-}};
+});
 
 }  // namespace
 
