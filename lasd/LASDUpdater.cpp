@@ -55,8 +55,16 @@ LASDUpdater& LASDUpdater::shared() {
 
 void LASDUpdater::checkForUpdate(MobileHelperServer* server, std::uint32_t mask) {
     Log(LogLevel::kInfo, "Trying to see if update available for mask %x", mask);
+    if (++checksUnderWay_ > kChecksMax) {
+        --checksUnderWay_;
+        Log(LogLevel::kError, "database check dropped: %u are under way", kChecksMax);
+        return;
+    }
     const std::uint32_t hold = ServerHoldAcquire(server);
-    submit([this, server, mask, hold] { runUpdateCheck(server, mask, hold); });
+    submit([this, server, mask, hold] {
+        runUpdateCheck(server, mask, hold);
+        --checksUnderWay_;
+    });
 }
 
 void LASDUpdater::runUpdateCheck(MobileHelperServer* server,
