@@ -57,6 +57,6 @@ private:
     void updateDatabases(MobileHelperServer* server, std::uint32_t types);
     [[nodiscard]] bool record(DatabaseType type);
 
-    std::atomic<std::uint32_t> checksUnderWay_ = 0;
+    const std::shared_ptr<std::atomic<std::uint32_t>> checksUnderWay_;
     DatabaseVersions versions_;  // on the work queue
 };
