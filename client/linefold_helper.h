@@ -81,8 +81,6 @@ enum LFMobileHelperCode {
     LF_MOBILE_HELPER_NO_DATA = 9,
     /* The group of the caller is not entitled. */
     LF_MOBILE_HELPER_NOT_ENTITLED = 35,
-    /* The service was built without this operation. */
-    LF_MOBILE_HELPER_NOT_SUPPORTED = 46,
     /* A message has a descriptor of the wrong type, or two sizes in it disagree. */
     LF_MOBILE_HELPER_TYPE_ERROR = -300,
     /* No routine has this message id. */

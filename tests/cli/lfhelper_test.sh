@@ -93,7 +93,7 @@ usage 'HEX must be pairs of hexadecimal digits' raw 1 0
 usage 'HEX must be pairs of hexadecimal digits' raw 1 0g
 usage 'the value of --claim-size must be' raw --claim-size=-1 1
 usage 'the option --complex belongs to the command raw' --complex check-in
-usage 'the option --wait belongs to the command civic-address or wan-ip' --wait country-code
+usage 'the option --wait belongs to the command update-databases, civic-address or wan-ip' --wait country-code
 usage 'too few arguments for civic-address' civic-address 51.5
 usage 'too many arguments for wan-ip' wan-ip 1
 for degrees in north '' 51.5x 0x10 1,5; do

@@ -19,15 +19,16 @@ struct KnownOption {
     }
 
     [[nodiscard]] std::string commandNames() const {
-        std::string names;
-        for (const std::string_view command : commands) {
-            names += (names.empty() || command.empty() ? "" : " or ") + std::string(command);
+        const auto end = std::ranges::find(commands, std::string_view());
+        std::string names(commands[0]);
+        for (auto command = commands.begin() + 1; command < end; ++command) {
+            names += (command + 1 == end ? " or " : ", ") + std::string(*command);
         }
         return names;
     }
 };
 
-constexpr std::array<KnownOption, 13> kKnownOptions{{
+constexpr auto kKnownOptions = std::to_array<KnownOption>({
     {"help", Takes::kNothing},
     {"version", Takes::kNothing},
     {"json", Takes::kNothing},
@@ -41,7 +42,7 @@ constexpr std::array<KnownOption, 13> kKnownOptions{{
     {"types", Takes::kValue, {"update-databases"}},
     {"timeout", Takes::kValue, {"update-databases"}},
     {"wait", Takes::kNothing, {"update-databases", "civic-address", "wan-ip"}},
-}};
+});
 
 /// The first word of commands that have two.
 constexpr std::string_view kCommandGroup = "preferences";
