@@ -2,7 +2,7 @@
 
 #include "Helper/Shared/Server/MessageLayouts.h"
 #include "Helper/Shared/Server/RequestProtocol.h"
-#include "lasd/UpdaterTest.h"
+#include "lasd/Updater_test.h"
 
 using namespace updater_test;
 

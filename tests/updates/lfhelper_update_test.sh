@@ -36,7 +36,7 @@ mkdir -p "$web/1/v3" "$web/databases"
 "$programs/activator" "$socket" com.vendra.linefold.mobile-helper "$programs/LinefoldMobileHelper" &
 while [ ! -S "$socket" ]; do sleep 0.01; done
 "$programs/linefold-sim" configuration-server "$web" >/tmp/web.log &
-while ! grep -q serving /tmp/web.log; do sleep 0.01; done
+while ! grep -qs serving /tmp/web.log; do sleep 0.01; done
 
 # What is wrong with the words is told before anything is asked.
 for types in '' gsm, ,gsm gsm,,lte GSM foo 0x -1 4294967296 'gsm lte'; do
@@ -99,7 +99,7 @@ says 'no result came within 1 seconds'
 # The telephony daemon has its port: nothing is asked.
 before=$(requests)
 "$programs/linefold-sim" telephony --only lasd >/tmp/heard &
-while ! grep -q ready /tmp/heard; do sleep 0.01; done
+while ! grep -qs ready /tmp/heard; do sleep 0.01; done
 exits 3 --types gsm --wait
 says 'somebody owns the port com.vendra.Linefold.lasd'
 expect "requests meanwhile" "$before" "$(requests)"
