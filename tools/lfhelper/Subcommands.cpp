@@ -10,8 +10,8 @@
 #include <vector>
 
 #include "Helper/Shared/Server/MessageLayouts.h"
-#include "tools/lfhelper/HeartbeatCommands.h"
 #include "tools/lfhelper/FileCommands.h"
+#include "tools/lfhelper/HeartbeatCommands.h"
 #include "tools/lfhelper/HexDump.h"
 #include "tools/lfhelper/LocationCommands.h"
 #include "tools/lfhelper/PreferenceCommands.h"
@@ -263,7 +263,8 @@ constexpr auto kSubcommands = std::to_array<Subcommand>({
      "\n"
      "With --wait the exit status is 0 when each type was updated or needed no update, and 1 when\n"
      "one failed or the time was over; then too the outcomes that came are shown. A type whose\n"
-     "entry in the index has no URL has no outcome at all.\n"
+     "entry in the index has no URL has no outcome at all. A failure, or that nothing was to be\n"
+     "done, may be the end of a request that was made before: they name no type.\n"
      "\n"
      "Examples:\n"
      "  lfhelper update-databases --types gsm,lte\n"
