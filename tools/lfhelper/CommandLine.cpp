@@ -11,25 +11,42 @@ enum class Takes { kNothing, kValue };
 struct KnownOption {
     std::string_view name;
     Takes takes;
-    /// The one command that it belongs to; empty for all.
-    std::string_view command;
+    /// The commands that it belongs to; none for all.
+    std::array<std::string_view, 2> commands{};
+
+    [[nodiscard]] bool belongsTo(std::string_view command) const {
+        return commands[0].empty() || std::ranges::find(commands, command) != commands.end();
+    }
+
+    [[nodiscard]] std::string commandNames() const {
+        std::string names;
+        for (const std::string_view command : commands) {
+            names += (names.empty() || command.empty() ? "" : " or ") + std::string(command);
+        }
+        return names;
+    }
 };
 
-constexpr std::array<KnownOption, 10> kKnownOptions{{
-    {"help", Takes::kNothing, ""},
-    {"version", Takes::kNothing, ""},
-    {"json", Takes::kNothing, ""},
-    {"group", Takes::kValue, ""},
-    {"service", Takes::kValue, ""},
-    {"complex", Takes::kNothing, "raw"},
-    {"claim-size", Takes::kValue, "raw"},
-    {"application", Takes::kNothing, "preferences get"},
-    {"plist", Takes::kNothing, "preferences get"},
-    {"type", Takes::kValue, "preferences set"},
+constexpr std::array<KnownOption, 11> kKnownOptions{{
+    {"help", Takes::kNothing},
+    {"version", Takes::kNothing},
+    {"json", Takes::kNothing},
+    {"group", Takes::kValue},
+    {"service", Takes::kValue},
+    {"complex", Takes::kNothing, {"raw"}},
+    {"claim-size", Takes::kValue, {"raw"}},
+    {"key", Takes::kValue, {"voicemail get-token", "voicemail set-token"}},
+    {"application", Takes::kNothing, {"preferences get"}},
+    {"plist", Takes::kNothing, {"preferences get"}},
+    {"type", Takes::kValue, {"preferences set"}},
 }};
 
-/// The first word of commands that have two.
-constexpr std::string_view kCommandGroup = "preferences";
+/// The first words of commands that have two.
+constexpr std::array<std::string_view, 2> kCommandGroups{"preferences", "voicemail"};
+
+bool IsCommandGroup(std::string_view word) {
+    return std::ranges::find(kCommandGroups, word) != kCommandGroups.end();
+}
 
 const KnownOption* FindKnownOption(std::string_view name) {
     const auto found = std::ranges::find(kKnownOptions, name, &KnownOption::name);
@@ -79,7 +96,7 @@ private:
         if (!hasCommand_) {
             hasCommand_ = true;
             line_.command = argument;
-        } else if (line_.command == kCommandGroup) {
+        } else if (IsCommandGroup(line_.command)) {
             line_.command.append(" ").append(argument);
         } else {
             line_.operands.emplace_back(argument);
@@ -109,10 +126,10 @@ private:
 
     void checkCommands() {
         for (const auto& option : line_.options) {
-            const std::string_view command = FindKnownOption(option.name)->command;
-            if (!command.empty() && command != line_.command) {
+            const KnownOption& known = *FindKnownOption(option.name);
+            if (!known.belongsTo(line_.command)) {
                 fail("the option --" + std::string(option.name) + " belongs to the command " +
-                     std::string(command));
+                     known.commandNames());
             }
         }
     }

@@ -4,14 +4,16 @@
 
 #include <algorithm>
 #include <array>
-#include <charconv>
 #include <optional>
-#include <system_error>
 #include <vector>
 
 #include "Helper/Shared/Server/MessageLayouts.h"
+#include "tools/lfhelper/DoctorCommand.h"
 #include "tools/lfhelper/HexDump.h"
+#include "tools/lfhelper/ParseNumber.h"
 #include "tools/lfhelper/PreferenceCommands.h"
+#include "tools/lfhelper/RadioCommands.h"
+#include "tools/lfhelper/VoicemailCommands.h"
 
 namespace lfhelper {
 namespace {
@@ -54,19 +56,6 @@ Preparation PrepareRemovePreferenceDomain(const CommandLine& line) {
         answer.fields.add("domain", domain);
         return answer;
     }};
-}
-
-/// A decimal number, or a hexadecimal one behind 0x.
-template <typename Number>
-std::optional<Number> ParseNumber(std::string_view text) {
-    const bool isHex = text.starts_with("0x") || text.starts_with("0X");
-    const std::string_view digits = isHex ? text.substr(2) : text;
-    Number number{};
-    const char* const end = digits.data() + digits.size();
-    const auto [rest, error] = std::from_chars(digits.data(), end, number, isHex ? 16 : 10);
-    const bool hasSignBehindPrefix = isHex && digits.starts_with('-');
-    return error == std::errc{} && rest == end && !hasSignBehindPrefix ? std::optional(number)
-                                                                       : std::nullopt;
 }
 
 std::vector<std::byte> MakeMessage(const platform::MachMsgHeader& header, ByteSpan body) {
@@ -137,7 +126,7 @@ Preparation PrepareRaw(const CommandLine& line) {
     return {.request = [message](LFMobileHelper* helper) { return SendAndDump(helper, message); }};
 }
 
-constexpr std::array<Subcommand, 8> kSubcommands{{
+constexpr std::array<Subcommand, 15> kSubcommands{{
     {"check-in",
      "",
      "ask whether the service is there and takes this caller",
@@ -149,6 +138,100 @@ constexpr std::array<Subcommand, 8> kSubcommands{{
      0,
      0,
      PrepareCheckIn},
+    {"doctor",
+     "",
+     "check this system and say what keeps the service from its work",
+     "Looks at all that the service needs, and prints a line for each: \"ok\", \"note\" for what "
+     "may\n"
+     "well be so, \"problem\" for what must be mended, with what to do about it. It changes "
+     "nothing "
+     "and\n"
+     "asks the service for nothing but a check-in. As root it sees most; what it cannot see it "
+     "says "
+     "in\n"
+     "a note.\n"
+     "\n"
+     "The exit status is 1 when there is a problem. With --json, \"checks\" holds an object for "
+     "each\n"
+     "line: \"check\", \"level\", \"finding\", and \"remedy\", which is null where there is "
+     "nothing to do.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper doctor\n"
+     "  lfhelper doctor --group linefold-telephony --json\n",
+     0,
+     0,
+     PrepareDoctor},
+    {"voicemail set-token",
+     "[--key KEY] TOKEN",
+     "store a voicemail token",
+     "Stores the access token, or one under a key, in place of an earlier one: a text in UTF-8 of "
+     "at\n"
+     "most 256 bytes. When TOKEN is -, standard input holds it, without the line feed at its end. "
+     "A\n"
+     "token is a secret: other users can see the arguments of a process, but not its input.\n"
+     "\n"
+     "  --key KEY    store it under this key, also a text of at most 256 bytes\n"
+     "\n"
+     "A token of 256 bytes is stored but cannot be read by \"voicemail get-token\". The service\n"
+     "answers success also when it could not write its store: its log tells.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper voicemail set-token - <token-file\n"
+     "  lfhelper voicemail set-token --key +15550100 - <token-file\n",
+     1,
+     1,
+     PrepareVoicemailSetToken},
+    {"voicemail get-token",
+     "[--key KEY]",
+     "show a voicemail token",
+     "Shows the access token, or the one under a key. That there is none, or one of 256 bytes, "
+     "which "
+     "no\n"
+     "reply holds, is no failure of the service: nothing is printed but a note on standard error, "
+     "and\n"
+     "the exit status is 4. With --json, \"token\" is null then.\n"
+     "\n"
+     "  --key KEY    show the token under this key\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper voicemail get-token\n"
+     "  lfhelper voicemail get-token --key +15550100\n",
+     0,
+     0,
+     PrepareVoicemailGetToken},
+    {"voicemail clear-token",
+     "",
+     "forget the voicemail token, and no token under a key",
+     "Forgets the access token; that there is none is a success too. Tokens under keys stay.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper voicemail clear-token\n",
+     0,
+     0,
+     PrepareVoicemailClearToken},
+    {"voicemail remove-all",
+     "",
+     "forget all voicemail tokens",
+     "Forgets the access token and the tokens under all keys.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper voicemail remove-all\n",
+     0,
+     0,
+     PrepareVoicemailRemoveAll},
+    {"voicemail is-subscribed",
+     "",
+     "ask whether the subscriber uses visual voicemail",
+     "Shows \"subscribed\" or \"not subscribed\", which is the answer too where the system has no\n"
+     "visual voicemail. The exit status is 0 in both cases.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper voicemail is-subscribed\n"
+     "  lfhelper --json voicemail is-subscribed\n",
+     0,
+     0,
+     PrepareVoicemailIsSubscribed},
     {"link-carrier-bundle",
      "TARGET LINK [DOMAIN]",
      "point a carrier or operator bundle link at a bundle",
@@ -241,6 +324,18 @@ constexpr std::array<Subcommand, 8> kSubcommands{{
      2,
      2,
      PreparePreferencesRemove},
+    {"radio-logging",
+     "on|off|N",
+     "switch the logging of the radio manager",
+     "Has the radio manager log everything (on) or errors alone (off). A number is sent as it is:\n"
+     "0 switches off, any other on. The service answers success also where no radio manager runs.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper radio-logging on\n"
+     "  lfhelper radio-logging 0\n",
+     1,
+     1,
+     PrepareRadioLogging},
     {"raw",
      "[--complex] [--claim-size N] ID [HEX]",
      "send a message as it is, and show the reply field by field",
