@@ -105,7 +105,7 @@ the_entitlement_is_looked_at() {
     line problem entitled-group 'there is no group no-such-group'
     exits 1 doctor --group mobile
     line problem entitlement-file "$entitlements/mobile.plist is not there"
-    line problem service-answer 'not entitled'
+    line problem service-answer 'the group mobile is not entitled'
     chmod 777 "$entitlements"
     exits 1 doctor
     line problem entitlement-folder 'can be written by others than root'

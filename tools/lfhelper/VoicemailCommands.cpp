@@ -40,7 +40,7 @@ Answer GetToken(LFMobileHelper* helper, const Key& key) {
     }
     if (token.front() == '\0') {
         answer.absence = "there is no token" + (key ? " under the key \"" + *key + "\"" : "") +
-                         ", or none that a reply holds";
+                         ", or it is too long to be read";
         answer.fields.addNull("token");
     } else {
         answer.text = std::string(token.data()) + "\n";

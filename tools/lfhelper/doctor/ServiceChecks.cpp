@@ -79,6 +79,12 @@ Finding JudgeAnswer(const Subject& subject, bool hasGroup, std::optional<std::in
                         subject.group,
                     "run this as root");
     }
+    if (*code == LF_MOBILE_HELPER_NOT_ENTITLED) {
+        return Problem(kAnswer,
+                       "the service answers, but does not take this caller: the group " +
+                           subject.group + " is not entitled",
+                       "mend what the lines above say about the entitlement");
+    }
     return Problem(kAnswer,
                    "the service cannot be used: " + std::string(LFMobileHelperErrorString(*code)),
                    kReadLog);
