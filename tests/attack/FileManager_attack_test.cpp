@@ -5,7 +5,7 @@
 namespace attack {
 namespace {
 
-constexpr int kRounds = 10;
+constexpr int kRounds = 6;
 constexpr int kOperations = 4000 / kScale;
 
 // In rounds, since the home grows with what is copied into it.
