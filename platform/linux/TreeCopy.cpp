@@ -94,11 +94,13 @@ private:
     int copyFolder(const ItemPlace& source, const ItemPlace& copy);
     int enter(const ItemPlace& source, const ItemPlace& copy);
     int refuseItself(const struct stat& status);
+    int beginWith(const Folder& top);
     int copyEntries();
     int finish();
     int copyEntry(const ItemPlace& source, const ItemPlace& copy, unsigned char type);
     int copyFile(const ItemPlace& source, const ItemPlace& copy);
     int copyLink(const ItemPlace& source, const ItemPlace& copy);
+    int leaveOut(const ItemPlace& source);
     int rememberName(const struct stat& status, const std::string& name);
     int leaveOut(const ItemPlace& copy, int error);
 
@@ -187,7 +189,7 @@ int TreeCopy::enter(const ItemPlace& source, const ItemPlace& copy) {
         return error;
     }
     if (levels_.empty()) {
-        error = level.copy.identify(&top_);
+        error = beginWith(level.copy);
     } else {
         path_ += source.name + "/";
     }
@@ -201,6 +203,17 @@ int TreeCopy::enter(const ItemPlace& source, const ItemPlace& copy) {
         }
     }
     return error != 0 ? error : pending_.enter();
+}
+
+/// The top of the copy. A folder with the set-group-id bit hands that and its group down: what is
+/// made here has neither from anybody.
+int TreeCopy::beginWith(const Folder& top) {
+    const int folder = top.file().get();
+    if (fchown(folder, static_cast<uid_t>(-1), getegid()) != 0 ||
+        fchmod(folder, kModeWhileUnfinished) != 0) {
+        return errno;
+    }
+    return top.identify(&top_);
 }
 
 /// A copy that lies inside its source would never end.
@@ -257,7 +270,8 @@ int TreeCopy::finish() {
 int TreeCopy::copyFile(const ItemPlace& source, const ItemPlace& copy) {
     const OwnedFd file(openat(source.folder.get(), source.name.c_str(), kSourceFlags));
     if (!file.isOpen()) {
-        return errno;
+        const int error = errno;
+        return error == ENXIO ? leaveOut(source) : error;
     }
 
     struct stat status {};
@@ -266,7 +280,7 @@ int TreeCopy::copyFile(const ItemPlace& source, const ItemPlace& copy) {
         return errno;
     }
     if (!S_ISREG(status.st_mode)) {
-        return ESTALE;  // something else has taken its place since it was looked at
+        return leaveOut(source);
     }
     if (int error = 0; status.st_nlink > 1 && !levels_.empty() &&
                        hardLinks_.linkAgain(status, levels_.front().copy.file(), copy, &error)) {
@@ -287,6 +301,19 @@ int TreeCopy::copyFile(const ItemPlace& source, const ItemPlace& copy) {
         error = FinishCopy(made, status);
     }
     return error != 0 ? error : rememberName(status, copy.name);
+}
+
+/// What its folder called a file and is none: a mount point, or put there just now.
+int TreeCopy::leaveOut(const ItemPlace& source) {
+    struct stat status {};
+
+    if (fstatat(source.folder.get(), source.name.c_str(), &status, AT_SYMLINK_NOFOLLOW) != 0) {
+        return errno;
+    }
+    if (S_ISREG(status.st_mode) || S_ISDIR(status.st_mode) || S_ISLNK(status.st_mode)) {
+        return ESTALE;
+    }
+    return levels_.empty() ? EOPNOTSUPP : 0;
 }
 
 int TreeCopy::copyLink(const ItemPlace& source, const ItemPlace& copy) {
@@ -311,6 +338,12 @@ int TreeCopy::copyLink(const ItemPlace& source, const ItemPlace& copy) {
     const std::array times{status.st_atim, status.st_mtim};
     if (symlinkat(text.data(), folder, copy.name.c_str()) != 0 ||
         utimensat(folder, copy.name.c_str(), times.data(), AT_SYMLINK_NOFOLLOW) != 0) {
+        return errno;
+    }
+    if (levels_.empty() &&
+        fchownat(
+            folder, copy.name.c_str(), static_cast<uid_t>(-1), getegid(), AT_SYMLINK_NOFOLLOW) !=
+            0) {
         return errno;
     }
     return rememberName(status, copy.name);
