@@ -196,6 +196,33 @@ TEST_F(ArchiveCopier, GoesThroughNoLinkInTheDestination) {
     EXPECT_FALSE(fs::is_symlink(kDestination + "/file"));
 }
 
+/// A link of root's is one that leads us.
+TEST_F(ArchiveCopier, GivesLinksOfAnArchiveToTheOwnerOfTheDestination) {
+    fs::create_directories(kDestination);
+    ASSERT_EQ(chown(kDestination.c_str(), 501, 501), 0);
+    const std::string archive =
+        zip::Write({zip::Link("a/link", "../b"), zip::File("b", "x"), zip::Link("link", "b")});
+    for (int time = 0; time < 2; ++time) {
+        EXPECT_EQ(expand(archive), 0);
+        EXPECT_EQ(
+            zip::Listing(kDestination),
+            (Lines{
+                "d 0755 a ", "l 0777 a/link ../b of 501", "f 0644 b x", "l 0777 link b of 501"}));
+    }
+}
+
+TEST_F(ArchiveCopier, LeavesLinksThatItCopiesToTheirOwners) {
+    fs::create_directories(kPlace + "/tree/folder");
+    for (const char* link : {"/tree/folder/link", "/tree/link"}) {
+        fs::create_symlink("/etc", kPlace + link);
+        ASSERT_EQ(lchown((kPlace + link).c_str(), 501, 501), 0);
+    }
+    EXPECT_EQ(copy(kPlace + "/tree"), 0);
+    EXPECT_EQ(
+        zip::Listing(kDestination),
+        (Lines{"d 0755 folder ", "l 0777 folder/link /etc of 501", "l 0777 link /etc of 501"}));
+}
+
 TEST_F(ArchiveCopier, KeepsTheTimesOfFiles) {
     ASSERT_EQ(expand(zip::Write({zip::File("file", "x")})), 0);
     const auto age = fs::file_time_type::clock::now() - fs::last_write_time(kDestination + "/file");
