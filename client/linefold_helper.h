@@ -81,8 +81,6 @@ enum LFMobileHelperCode {
     LF_MOBILE_HELPER_NO_DATA = 9,
     /* The group of the caller is not entitled. */
     LF_MOBILE_HELPER_NOT_ENTITLED = 35,
-    /* The service was built without this operation. */
-    LF_MOBILE_HELPER_NOT_SUPPORTED = 46,
     /* A message has a descriptor of the wrong type, or two sizes in it disagree. */
     LF_MOBILE_HELPER_TYPE_ERROR = -300,
     /* No routine has this message id. */
@@ -284,7 +282,8 @@ LF_MOBILE_HELPER_EXPORT int32_t LFMobileHelperCopyCountryCode(
 /* Looks up the public address of the device and reports it to the telephony daemon. */
 LF_MOBILE_HELPER_EXPORT int32_t LFMobileHelperRequestWanIPFromLocation(LFMobileHelper* helper);
 
-/* Starts (other than 0) or stops (0) the heartbeat on the cellular interface. */
+/* Starts (other than 0) or stops (0) the heartbeat on the cellular interface. It outlives the client
+ * and keeps the service alive until it is stopped; started twice, it keeps it for good. */
 LF_MOBILE_HELPER_EXPORT int32_t LFMobileHelperSetHeartbeatEnabled(LFMobileHelper* helper,
                                                                   int32_t isEnabled);
 

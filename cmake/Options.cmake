@@ -14,6 +14,11 @@ set(LINEFOLD_CONFIGURATION_DIR "/etc/linefold" CACHE STRING "Folder of the confi
 set(LINEFOLD_DEFAULT_GROUP "linefold-telephony" CACHE STRING
     "Entitled group that lfhelper takes when root starts it")
 set(LINEFOLD_IDLE_INTERVAL "10.0" CACHE STRING "Seconds without work until the daemon leaves")
+set(LINEFOLD_HTTP_CONNECT_TIMEOUT_MS "30000" CACHE STRING
+    "Milliseconds until a server must be connected to")
+set(LINEFOLD_HTTP_STALL_TIMEOUT "60" CACHE STRING
+    "Seconds that a server may send less than 1 byte a second")
+set(LINEFOLD_HTTP_TOTAL_TIMEOUT "3600" CACHE STRING "Seconds until a server must have sent all")
 
 set(CMAKE_CXX_FLAGS_RELEASE "-O2 -DNDEBUG")
 

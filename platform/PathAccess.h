@@ -71,7 +71,8 @@ public:
     /// rename(2): what is here takes the place of what may be there.
     [[nodiscard]] int moveOnto(const PathAccess& destination) const;
 
-    /// fsync(2) of the file or directory, and then of the folder that it lies in.
+    /// fsync(2) of the file or directory, and then of the folder that it lies in. A failure is told
+    /// in one error line.
     [[nodiscard]] int synchronize() const;
 
     /// What the twin keeps, for the file manager of the same twin.

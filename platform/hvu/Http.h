@@ -60,8 +60,21 @@ public:
 
     [[nodiscard]] CellularUse cellularUse() const { return cellularUse_; }
 
+    /// The largest body, decoded, likewise; what is larger is ErrorType::kBodyTooLarge.
+    void setBodyLimit(std::size_t bytes) { bodyLimit_ = bytes; }
+
+    [[nodiscard]] std::size_t bodyLimit() const { return bodyLimit_; }
+
+    /// Until a server must have sent all, if that is less than the platform lets it have anyhow;
+    /// likewise.
+    void setTimeLimit(long seconds) { timeLimitSeconds_ = seconds; }
+
+    [[nodiscard]] std::optional<long> timeLimitSeconds() const { return timeLimitSeconds_; }
+
 private:
     CellularUse cellularUse_ = CellularUse::kAllowed;
+    std::size_t bodyLimit_ = std::size_t{256} << 20;
+    std::optional<long> timeLimitSeconds_{};
 };
 
 /// What a server answered, or why it did not.
@@ -80,8 +93,9 @@ public:
 
     [[nodiscard]] int statusCode() const { return parts_.statusCode; }
 
-    /// At most 256 MiB. A body that came with the content encoding gzip is decoded, unless its
-    /// content type contains "gzip": then it is as it came.
+    /// At most as large as the session lets it be, 256 MiB unless it was told otherwise. A body
+    /// that came with the content encoding gzip is decoded, unless its content type contains
+    /// "gzip": then it is as it came.
     [[nodiscard]] const std::vector<std::byte>& body() const { return parts_.body; }
 
     /// The body, moved out.

@@ -294,7 +294,7 @@ int FileManagerReplaceContents(const PathAccess& item, std::span<const std::byte
     if (const int error = ModeFor(state, &mode); error != 0) {
         return error;
     }
-    ReplacementFile file(state.parent, TemporaryName("new"));
+    ReplacementFile file(state.parent.get(), TemporaryName("new"));
     const int error = file.make(mode, [contents](const ReplacementFile::Put& put) {
         put({reinterpret_cast<const char*>(contents.data()), contents.size()});
     });

@@ -7,10 +7,12 @@
 #include <array>
 #include <cerrno>
 #include <climits>
+#include <cstring>
 
 #include "platform/linux/OwnedFd.h"
 #include "platform/linux/PathState.h"
 #include "platform/linux/PathWalk.h"
+#include "platform/linux/PlatformLog.h"
 #include "platform/linux/WholeFile.h"
 
 namespace platform {
@@ -83,7 +85,8 @@ int Synchronize(int directory, const char* name) {
 PathAccess::PathAccess(std::string_view path) : state_(std::make_unique<State>()) {
     const SplitPath split = Split(path);
     Opened parent = OpenParent(path);
-    *state_ = {.parent = std::move(parent.file),
+    *state_ = {.path = std::string(path),
+               .parent = std::move(parent.file),
                .name = std::string(split.last.substr(0, split.last.find('/'))),
                .endsInSlash = split.endsInSlash,
                .error = parent.error};
@@ -218,11 +221,21 @@ int PathAccess::moveOnto(const PathAccess& destination) const {
 }
 
 int PathAccess::synchronize() const {
-    if (state_->error != 0) {
-        return state_->error;
+    int error = state_->error;
+    if (error == 0) {
+        error = Synchronize(state_->parent.get(), state_->nameAsGiven().c_str());
     }
-    const int error = Synchronize(state_->parent.get(), state_->nameAsGiven().c_str());
-    return error != 0 ? error : Synchronize(state_->parent.get(), ".");
+    if (error == 0) {
+        error = Synchronize(state_->parent.get(), ".");
+    }
+    if (error != 0) {
+        // Whoever asked has no line for this, and the disk is an operator's to mend.
+        PlatformLog(LogLevel::kError,
+                    "path access: %s could not be brought to disk: %s",
+                    state_->path.c_str(),
+                    std::strerror(error));
+    }
+    return error;
 }
 
 }  // namespace platform

@@ -53,6 +53,16 @@ protected:
         return PathAccess(path(name)).lstat(&status);
     }
 
+    /// The same of stat.
+    [[nodiscard]] int lookBehind(const std::string& name) const {
+        FileStatus status;
+        return PathAccess(path(name)).stat(&status);
+    }
+
+    [[nodiscard]] int move(const std::string& from, const std::string& to) const {
+        return PathAccess(path(from)).moveOnto(PathAccess(path(to)));
+    }
+
     [[nodiscard]] std::uint32_t typeOf(const std::string& name) const {
         FileStatus status;
         EXPECT_EQ(PathAccess(path(name)).lstat(&status), 0) << name;
@@ -320,6 +330,131 @@ TEST_F(PathAccessTest, StaysInTheFolderItWasResolvedTo) {
     EXPECT_EQ(access.symlink("contents"), 0);
     EXPECT_TRUE(isThere("mobile/elsewhere/new"));
     EXPECT_FALSE(isThere("root/folder/new"));
+}
+
+TEST_F(PathAccessTest, TellsWhatALinkInTheLastStepLeadsTo) {
+    rootsLink("toFile", "mobile/file");
+    rootsLink("toFolder", "root");
+    FileStatus status;
+    ASSERT_EQ(PathAccess(path("toFile")).stat(&status), 0);
+    EXPECT_EQ(status.uid, kMobile);
+    EXPECT_EQ(status.mode & kTypeBits, std::uint32_t{S_IFREG});
+    ASSERT_EQ(PathAccess(path("toFolder")).stat(&status), 0);
+    EXPECT_EQ(status.mode & kTypeBits, std::uint32_t{S_IFDIR});
+    EXPECT_EQ(lookBehind("toFolder/"), 0);
+    EXPECT_EQ(lookBehind("toFile/"), ENOTDIR);
+    EXPECT_EQ(lookBehind("root/file"), 0);
+}
+
+TEST_F(PathAccessTest, LooksBehindNoLinkToWhatItsOwnerDoesNotOwn) {
+    mobilesLink("mobile/toRoots", "../root/file");
+    mobilesLink("mobile/toOwn", "file");
+    mobilesLink("mobile/dangling", "missing");
+    mobilesLink("mobile/loop", "loop");
+    EXPECT_EQ(lookBehind("mobile/toRoots"), EPERM);
+    EXPECT_EQ(lookBehind("mobile/toOwn"), 0);
+    EXPECT_EQ(lookBehind("mobile/dangling"), ENOENT);
+    EXPECT_EQ(lookBehind("mobile/loop"), ELOOP);
+    EXPECT_EQ(lookBehind("mobile/missing"), ENOENT);
+}
+
+TEST_F(PathAccessTest, MakesFoldersWhereNothingIs) {
+    rootsLink("dangling", "missing");
+    EXPECT_EQ(PathAccess(path("new")).makeDirectory(0700), 0);
+    EXPECT_EQ(fs::status(path("new")).permissions(), fs::perms(0700));
+    EXPECT_EQ(PathAccess(path("other/")).makeDirectory(0755), 0);
+    for (const char* taken : {"new", "root/file", "dangling", "root/.", "root/.."}) {
+        EXPECT_EQ(PathAccess(path(taken)).makeDirectory(0755), EEXIST) << taken;
+    }
+    EXPECT_EQ(PathAccess("/").makeDirectory(0755), EEXIST);
+    EXPECT_EQ(PathAccess(path("nowhere/new")).makeDirectory(0755), ENOENT);
+    EXPECT_EQ(PathAccess(path("root/file/new")).makeDirectory(0755), ENOTDIR);
+    EXPECT_FALSE(isThere("missing"));
+}
+
+TEST_F(PathAccessTest, MakesFoldersWithTheModeLessTheMask) {
+    const mode_t mask = umask(027);
+    EXPECT_EQ(PathAccess(path("new")).makeDirectory(0777), 0);
+    umask(mask);
+    EXPECT_EQ(fs::status(path("new")).permissions(), fs::perms(0750));
+}
+
+TEST_F(PathAccessTest, MakesNoFolderBehindAPlantedLink) {
+    mobilesLink("mobile/link", "../root");
+    EXPECT_EQ(PathAccess(path("mobile/link/new")).makeDirectory(0755), EPERM);
+    EXPECT_FALSE(isThere("root/new"));
+}
+
+TEST_F(PathAccessTest, MovesInPlaceOfWhatIsThere) {
+    rootsLink("link", "root/file");
+    EXPECT_EQ(move("mobile/file", "root/file"), 0);
+    FileStatus status;
+    ASSERT_EQ(PathAccess(path("root/file")).lstat(&status), 0);
+    EXPECT_EQ(status.uid, kMobile);
+    EXPECT_EQ(move("link", "mobile/new"), 0);
+    EXPECT_EQ(typeOf("mobile/new"), S_IFLNK) << "a link moves as itself";
+    EXPECT_EQ(move("root/file", "mobile/new"), 0);
+    EXPECT_EQ(typeOf("mobile/new"), S_IFREG) << "and is replaced as itself";
+    EXPECT_EQ(move("mobile/new", "mobile/new"), 0);
+    EXPECT_TRUE(isThere("mobile/new"));
+}
+
+TEST_F(PathAccessTest, MovesFoldersOntoEmptyOnesOnly) {
+    fs::create_directory(path("empty"));
+    EXPECT_EQ(move("empty", "root"), ENOTEMPTY);
+    EXPECT_EQ(move("root/file", "empty"), EISDIR);
+    EXPECT_EQ(move("empty", "root/file"), ENOTDIR);
+    EXPECT_EQ(move("root", "root/folder/deeper"), EINVAL);
+    EXPECT_EQ(move("root/folder", "root"), ENOTEMPTY) << "it holds what is moved";
+    EXPECT_EQ(move("mobile", "empty"), 0);
+    EXPECT_TRUE(isThere("empty/file"));
+}
+
+TEST_F(PathAccessTest, DoesNotMoveWhatHasNoEntryOfItsOwn) {
+    EXPECT_EQ(move("missing", "new"), ENOENT);
+    EXPECT_EQ(move("root/file", "nowhere/new"), ENOENT);
+    EXPECT_EQ(move("root/file", "new/"), ENOTDIR) << "a slash wants a folder";
+    EXPECT_EQ(move("root/file/", "new"), ENOTDIR);
+    for (const char* entry : {"root/.", "root/.."}) {
+        EXPECT_EQ(move(entry, "new"), EBUSY) << entry;
+        EXPECT_EQ(move("mobile", entry), EBUSY) << entry;
+    }
+}
+
+TEST_F(PathAccessTest, MovesNothingThroughAPlantedLink) {
+    mobilesLink("mobile/link", "../root");
+    EXPECT_EQ(move("mobile/file", "mobile/link/file"), EPERM);
+    EXPECT_EQ(move("mobile/link/file", "mobile/new"), EPERM);
+    std::ifstream file(path("root/file"));
+    EXPECT_EQ(std::string(std::istreambuf_iterator<char>(file), {}), "root");
+    EXPECT_FALSE(isThere("mobile/new"));
+}
+
+TEST_F(PathAccessTest, SynchronizesFilesAndFolders) {
+    EXPECT_EQ(PathAccess(path("root/file")).synchronize(), 0);
+    EXPECT_EQ(PathAccess(path("root/folder")).synchronize(), 0);
+    EXPECT_EQ(PathAccess(path("missing")).synchronize(), ENOENT);
+    rootsLink("link", "root/file");
+    EXPECT_EQ(PathAccess(path("link")).synchronize(), ELOOP);
+    mobilesLink("mobile/link", "../root");
+    EXPECT_EQ(PathAccess(path("mobile/link/file")).synchronize(), EPERM);
+}
+
+TEST_F(PathAccessTest, DoesNotWaitForAFifoThatItSynchronizes) {
+    ASSERT_EQ(mkfifo(path("fifo").c_str(), 0600), 0);
+    EXPECT_EQ(PathAccess(path("fifo")).synchronize(), EINVAL);
+}
+
+TEST_F(PathAccessTest, AnswersEveryOperationWithTheErrorOfItsResolution) {
+    const PathAccess lost(path("nowhere/file"));
+    FileStatus status;
+    EXPECT_EQ(lost.lstat(&status), ENOENT);
+    EXPECT_EQ(lost.stat(&status), ENOENT);
+    EXPECT_EQ(lost.remove(), ENOENT);
+    EXPECT_EQ(lost.makeDirectory(0755), ENOENT);
+    EXPECT_EQ(lost.moveOnto(PathAccess(path("new"))), ENOENT);
+    EXPECT_EQ(PathAccess(path("root/file")).moveOnto(lost), ENOENT);
+    EXPECT_EQ(lost.synchronize(), ENOENT);
 }
 
 TEST_F(PathAccessTest, MovesWithItsResolution) {

@@ -9,6 +9,7 @@
 namespace platform {
 
 struct PathAccess::State {
+    std::string path;  ///< as it was given
     OwnedFd parent;
     std::string name;          ///< "." for the path "/"
     bool endsInSlash = false;  ///< what must then be a directory

@@ -2,38 +2,18 @@
 
 #include <fcntl.h>
 #include <sys/stat.h>
-#include <unistd.h>
 
 #include <array>
 #include <cerrno>
 #include <climits>
 #include <cstring>
-#include <optional>
 
-#include "platform/Assertion.h"
-#include "platform/PropertyListXml.h"
 #include "platform/linux/OwnedFd.h"
-#include "platform/linux/ReplacementFile.h"
-#include "platform/linux/WholeFile.h"
 
 namespace platform {
 namespace {
 
-using Contents = PreferenceFile::Contents;
-using State = PreferenceFile::State;
-
-/// One name for all domains: whatever a crash leaves behind, the next write removes.
-constexpr const char* kTemporaryName = ".linefold-mobile-helper.tmp";
-constexpr mode_t kNewMode = S_IRUSR | S_IWUSR;
 constexpr int kMaxLinks = 40;
-
-std::string ErrorText(int error) {
-    return strerrordesc_np(error);
-}
-
-Contents Unusable(State state, std::string complaint) {
-    return {.state = state, .complaint = std::move(complaint)};
-}
 
 /// Where a file really is: its folder, held open, and its name in there.
 struct Place {
@@ -64,23 +44,8 @@ Place FinalPlace(std::string path) {
     return {.folder = {}, .name = {}, .error = ELOOP};
 }
 
-/// Gives the damaged file a second name, since the new one is about to take its first. One that was
-/// kept earlier goes.
-int KeepDamaged(const Place& place) {
-    const int folder = place.folder.get();
-    const std::string kept = place.name + ".damaged";
-    if (unlinkat(folder, kept.c_str(), 0) != 0 && errno != ENOENT) {
-        return errno;
-    }
-    if (linkat(folder, place.name.c_str(), folder, kept.c_str(), 0) == 0) {
-        return 0;
-    }
-    // Where it may not have two names, as a file of somebody else's, it changes its one. Should the
-    // system stop now, the domain is empty, as it was.
-    return renameat(folder, place.name.c_str(), folder, kept.c_str()) == 0 ? 0 : errno;
-}
-
 mode_t ModeOf(const Place& place) {
+    constexpr mode_t kNewMode = S_IRUSR | S_IWUSR;
     constexpr mode_t kPermissions = S_IRWXU | S_IRWXG | S_IRWXO;
 
     struct stat status {};
@@ -93,58 +58,15 @@ mode_t ModeOf(const Place& place) {
 
 }  // namespace
 
-Contents PreferenceFile::read() const {
-    // Whatever it is, opening it must not wait: a FIFO without a writer would hold us for ever.
-    const OwnedFd file(open(path_.c_str(), O_RDONLY | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
-    if (!file.isOpen()) {
-        return errno == ENOENT
-                   ? Contents()
-                   : Unusable(State::kUnreadable, "cannot be read: " + ErrorText(errno));
-    }
-
-    struct stat status {};
-
-    if (fstat(file.get(), &status) != 0 || !S_ISREG(status.st_mode)) {
-        return Unusable(State::kUnreadable, "is not a regular file");
-    }
-    std::vector<std::byte> bytes;
-    const bool isTooLarge = status.st_size > static_cast<off_t>(kPropertyListLimits.bytes);
-    const int error =
-        isTooLarge
-            ? EFBIG
-            : ReadWhole(
-                  file, static_cast<std::size_t>(status.st_size), kPropertyListLimits.bytes, bytes);
-    if (error != 0) {
-        return Unusable(State::kUnreadable, "cannot be read: " + ErrorText(error));
-    }
-    auto entries = PropertyListCreateWithData(bytes);
-    if (!entries || entries->kind() != PropertyList::Kind::kDictionary) {
-        return Unusable(State::kDamaged, "is damaged: it holds no property list with a dictionary");
-    }
-    return {.state = State::kRead, .entries = std::move(*entries), .fileSize = bytes.size()};
+PreferenceFile::Contents PreferenceFile::read() const {
+    return PropertyListFile(AT_FDCWD, path_).read(PropertyListFile::Links::kFollowed);
 }
 
 std::string PreferenceFile::replace(const Contents& contents) const {
-    PLATFORM_ASSERT(contents.state != State::kUnreadable);
-    if (!XmlPropertyListSize(contents.entries)) {
-        return "cannot be written: it would hold more than 16 MiB or 200,000 objects, or "
-               "characters that XML cannot hold";
-    }
     const Place place = FinalPlace(path_);
-    if (place.error != 0) {
-        return "cannot be written: " + ErrorText(place.error);
-    }
-    ReplacementFile replacement(place.folder, kTemporaryName);
-    int error = replacement.make(ModeOf(place), [&contents](const ReplacementFile::Put& put) {
-        WriteXmlPropertyList(contents.entries, put);
-    });
-    if (error == 0 && contents.state == State::kDamaged) {
-        error = KeepDamaged(place);
-    }
-    if (error == 0) {
-        error = replacement.takePlace(place.name);
-    }
-    return error == 0 ? std::string() : "cannot be written: " + ErrorText(error);
+    return place.error == 0
+               ? PropertyListFile(place.folder.get(), place.name).replace(contents, ModeOf(place))
+               : std::string("cannot be written: ") + strerrordesc_np(place.error);
 }
 
 }  // namespace platform

@@ -15,8 +15,8 @@
 #include "platform/PreferenceChanges.h"
 #include "platform/PropertyListXml.h"
 #include "platform/UserDatabase.h"
+#include "platform/linux/Complaints.h"
 #include "platform/linux/FreedMemory.h"
-#include "platform/linux/PlatformLog.h"
 #include "platform/linux/PreferenceFile.h"
 #include "platform/linux/UserRights.h"
 
@@ -44,27 +44,6 @@ bool IsDomainName(std::string_view domain) {
            domain.find('\0') == std::string_view::npos;
 }
 
-/// Lines to be written when no lock is held any more: a log may be slow.
-class Complaints {
-public:
-    Complaints() = default;
-    Complaints(const Complaints&) = delete;
-    Complaints& operator=(const Complaints&) = delete;
-
-    ~Complaints() {
-        for (const auto& [subject, text] : lines_) {
-            PlatformLog(LogLevel::kError, "preferences: %s %s", subject.c_str(), text.c_str());
-        }
-    }
-
-    void add(std::string_view subject, std::string_view text) {
-        lines_.emplace_back(subject, text);
-    }
-
-private:
-    std::vector<std::pair<std::string, std::string>> lines_;
-};
-
 bool CheckDomainName(std::string_view domain, Complaints& complaints) {
     const bool isName = IsDomainName(domain);
     if (!isName) {
@@ -84,7 +63,7 @@ public:
     }
 
     void set(std::string_view domain, PreferenceChange change) {
-        Complaints complaints;
+        Complaints complaints("preferences");
         const std::lock_guard lock(mutex_);
         if (!CheckDomainName(domain, complaints)) {
             return;
@@ -101,7 +80,7 @@ public:
     }
 
     bool synchronize(std::string_view domain, Search search) {
-        Complaints complaints;
+        Complaints complaints("preferences");
         const std::lock_guard lock(mutex_);
         if (!IsDomainName(domain)) {
             return false;  // who set something there was told
@@ -115,7 +94,7 @@ public:
     }
 
     std::optional<PropertyList> copy(std::string_view key, std::string_view domain, Search search) {
-        Complaints complaints;
+        Complaints complaints("preferences");
         const std::lock_guard lock(mutex_);
         if (!CheckDomainName(domain, complaints)) {
             return std::nullopt;

@@ -6,6 +6,8 @@
 
 #include <cerrno>
 
+#include "platform/linux/OwnedFd.h"
+
 namespace platform {
 namespace {
 
@@ -60,15 +62,15 @@ private:
 
 ReplacementFile::~ReplacementFile() {
     if (isMade_) {
-        unlinkat(folder_.get(), temporaryName_.c_str(), 0);
+        unlinkat(folder_, temporaryName_.c_str(), 0);
     }
 }
 
 /// Nobody can have us write through what they put there: it is removed, and made anew by us.
 int ReplacementFile::make(mode_t mode, const std::function<void(const Put&)>& produce) {
     // What stays in the way all the same fails the creation.
-    (void)unlinkat(folder_.get(), temporaryName_.c_str(), 0);
-    const OwnedFd file(openat(folder_.get(),
+    (void)unlinkat(folder_, temporaryName_.c_str(), 0);
+    const OwnedFd file(openat(folder_,
                               temporaryName_.c_str(),
                               O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC,
                               kModeWhileUnfinished));
@@ -85,13 +87,15 @@ int ReplacementFile::make(mode_t mode, const std::function<void(const Put&)>& pr
 }
 
 int ReplacementFile::takePlace(const std::string& name) {
-    if (renameat(folder_.get(), temporaryName_.c_str(), folder_.get(), name.c_str()) != 0) {
+    if (renameat(folder_, temporaryName_.c_str(), folder_, name.c_str()) != 0) {
         return errno;
     }
     isMade_ = false;
-    // A folder is opened for reading to be synced; where that is not allowed the rename is as sure
-    // as the file system makes it.
-    const OwnedFd readable(openat(folder_.get(), ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    return SyncFolder(folder_);
+}
+
+int SyncFolder(int folder) {
+    const OwnedFd readable(openat(folder, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
     return readable.isOpen() && fsync(readable.get()) != 0 ? errno : 0;
 }
 

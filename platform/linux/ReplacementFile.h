@@ -7,15 +7,14 @@
 #include <string>
 #include <string_view>
 
-#include "platform/linux/OwnedFd.h"
-
 namespace platform {
 
 /// Goes with the object unless it took its place. All operations give 0 or an errno value.
 class ReplacementFile {
 public:
-    /// In this folder, under a temporary name that nobody else uses in it meanwhile.
-    ReplacementFile(const OwnedFd& folder, std::string temporaryName)
+    /// In this folder, which the caller holds open, under a temporary name that nobody else uses in
+    /// it meanwhile.
+    ReplacementFile(int folder, std::string temporaryName)
         : folder_(folder), temporaryName_(std::move(temporaryName)) {}
 
     ~ReplacementFile();
@@ -33,9 +32,13 @@ public:
     [[nodiscard]] int takePlace(const std::string& name);
 
 private:
-    const OwnedFd& folder_;
+    const int folder_;
     const std::string temporaryName_;
     bool isMade_ = false;
 };
+
+/// Has a folder's names on the disk. A folder is opened for reading to be synced; where that is not
+/// allowed, what was done in it is as sure as the file system makes it. 0 or an errno value.
+[[nodiscard]] int SyncFolder(int folder);
 
 }  // namespace platform

@@ -104,6 +104,9 @@ QualityOfService SerialQueue::service() const {
 }
 
 void SerialQueue::async(std::function<void()> task) const {
+    if (queuesStopped) {
+        return;  // no thread is started for what would not run
+    }
     state_->startedLoop().enqueue(state_->bind(std::move(task)));
 }
 

@@ -97,6 +97,9 @@ void HttpRequest::start(std::vector<std::byte> body) {
     TheWeb().requests.push_back(
         {.url = url_, .headers = headers_, .cellularUse = use, .queue = completionQueue_->label()});
     auto answer = AnswerTo(url_, use);
+    if (answer.body.size() > session_->bodyLimit()) {
+        answer = FailWith(ErrorType::kBodyTooLarge);
+    }
     if (fails) {
         answer.kind = sim::HttpAnswer::Kind::kNoResponse;
     }

@@ -22,6 +22,28 @@ FileStatus StatusOf(const Node& node) {
     return {.mode = node.file.mode, .uid = node.file.owner, .gid = node.file.groupId()};
 }
 
+bool NamesAnEntry(const Place& place) {
+    return !place.name.empty() && place.name != "." && place.name != "..";
+}
+
+/// Whether something may take the place of what stands there: 0 or why not.
+int ReplacementError(const Node& node, const Place& place) {
+    for (const Node* above = place.parent; above != sim::TreeRoot(); above = above->parent) {
+        if (above == &node) {
+            return EINVAL;
+        }
+    }
+    const Node* const replaced = NodeAt(place);
+    if (replaced == nullptr || replaced == &node) {
+        return 0;
+    }
+    const bool isDirectory = node.file.is(sim::kDirectory);
+    if (isDirectory != replaced->file.is(sim::kDirectory)) {
+        return isDirectory ? ENOTDIR : EISDIR;
+    }
+    return replaced->children.empty() ? 0 : ENOTEMPTY;
+}
+
 }  // namespace
 
 PathAccess::PathAccess(std::string_view path) : state_(std::make_unique<State>()) {
@@ -202,37 +224,28 @@ int PathAccess::moveOnto(const PathAccess& destination) const {
     if (sim::CallFails("PathAccess.moveOnto", state_->path + " -> " + destination.state_->path)) {
         return EIO;
     }
+    const State& end = *destination.state_;
+    if (state_->error != 0 || end.error != 0) {
+        return state_->error != 0 ? state_->error : end.error;
+    }
+    if (!NamesAnEntry(state_->place) || !NamesAnEntry(end.place)) {
+        return EBUSY;
+    }
     const Node* node = nullptr;
     if (const int error = state_->find(&node); error != 0) {
         return error;
     }
-    const State& end = *destination.state_;
-    if (end.error != 0) {
-        return end.error;
+    if (end.place.mustBeDirectory && !node->file.is(sim::kDirectory)) {
+        return ENOTDIR;
     }
-    for (const Node* above = end.place.parent; above != sim::TreeRoot(); above = above->parent) {
-        if (above == node) {
-            return EINVAL;
-        }
+    if (const int error = ReplacementError(*node, end.place); error != 0) {
+        return error;
     }
-    const Node* const replaced = NodeAt(end.place);
-    const bool isDirectory = node->file.is(sim::kDirectory);
-    if (replaced == node) {
+    if (NodeAt(end.place) == node) {
         return 0;
-    }
-    if (replaced != nullptr && isDirectory != replaced->file.is(sim::kDirectory)) {
-        return isDirectory ? ENOTDIR : EISDIR;
-    }
-    if (replaced != nullptr && !replaced->children.empty()) {
-        return ENOTEMPTY;
     }
     auto& siblings = state_->place.parent->children;
     const auto at = siblings.find(state_->place.name);
-    const bool endNamesNoEntry =
-        end.place.name.empty() || end.place.name == "." || end.place.name == "..";
-    if (at == siblings.end() || endNamesNoEntry) {
-        return EBUSY;
-    }
     auto moved = std::move(at->second);
     siblings.erase(at);
     moved->parent = end.place.parent;
@@ -245,7 +258,13 @@ int PathAccess::synchronize() const {
         return EIO;
     }
     const Node* node = nullptr;
-    return state_->find(&node);
+    if (const int error = state_->find(&node); error != 0) {
+        return error;
+    }
+    if (node->file.is(sim::kLink)) {
+        return ELOOP;
+    }
+    return node->file.is(sim::kRegular) || node->file.is(sim::kDirectory) ? 0 : EINVAL;
 }
 
 }  // namespace platform

@@ -180,10 +180,17 @@ void Reset(std::uint64_t seed) {
     world.script.tasks.clear();
     ResetPorts();
     ResetProcesses();
+    ResetEcho();
     ResetArchives();
     ResetFiles();
+    ResetLibraries();
+    ResetMailbox();
+    ResetRadioManager();
     ResetServices();
+    ResetGeocoding();
+    ResetTelephony();
     ResetMemory();
+    ResetMessagePorts();
     ResetHttp();
     ResetLogs();
     world.random.seed(seed);

@@ -114,12 +114,19 @@ void NoteCall(std::string_view name, std::string_view details = {});
 void ResetMainLoop();
 void ResetQueues();
 void ResetPorts();
+void ResetEcho();
 void ResetArchives();
 void ResetFiles();
+void ResetLibraries();
+void ResetMailbox();
+void ResetRadioManager();
 void ResetProcesses();
 void ResetLogs();
 void ResetServices();
+void ResetGeocoding();
+void ResetTelephony();
 void ResetMemory();
+void ResetMessagePorts();
 void ResetHttp();
 
 /// The daemon's exit sources see the exit of every process.

@@ -213,6 +213,15 @@ preference_domains_are_removed() {
     [ -e "$file" ] || fail "$what: the file is gone"
 }
 
+the_heartbeat_is_switched() {
+    exits 0 heartbeat on
+    prints 'heartbeat: success'
+    exits 0 --json heartbeat off
+    json '.state == "off" and .code == 0 and .command == "heartbeat"'
+    exits 2 --json heartbeat maybe
+    json '.exitStatus == 2 and .name == "USAGE"'
+}
+
 raw_messages_are_answered() {
     exits 1 raw 12345
     grep -q 'return code: -303 BAD_ID' /tmp/out || fail "$what: no return code"
@@ -248,6 +257,7 @@ programs_get_json
 carrier_bundles_are_linked
 symbolic_links_are_made
 preference_domains_are_removed
+the_heartbeat_is_switched
 raw_messages_are_answered
 only_the_entitled_are_served
 [ "$failures" = 0 ] && echo "lfhelper and the daemon agree"

@@ -12,12 +12,15 @@
 #include <thread>
 
 #include "platform/PropertyList.h"
+#include "tests/faults/FaultyDaemon.h"
 #include "tests/support/PhoneRoot.h"
 
 namespace fs = std::filesystem;
 
 namespace {
 
+using faults::FaultyDaemon;
+using faults::kFileCalls;
 using platform::PropertyList;
 
 constexpr const char* kDomain = "com.vendra.test";
@@ -141,78 +144,24 @@ std::string AsDaemonSpells(const std::string& path) {
     return path.substr(std::string_view("/private").size());
 }
 
-/// The daemon with a fault at the n-th of its calls of one name that touch the domain's files.
-class FaultyDaemon {
-public:
-    FaultyDaemon(const std::string& call, int n, const std::string& fault)
-        : daemon_({.wrapper = {"/usr/bin/strace",
-                               "--quiet=attach,path-resolution",
-                               "-D",
-                               "-f",
-                               "-o",
-                               kTrace,
-                               "-P",
-                               TemporaryFile(),
-                               "-P",
-                               DomainFile(),
-                               "-P",
-                               AsDaemonSpells(DomainFile()),
-                               "-P",
-                               Folder(),
-                               "-P",
-                               AsDaemonSpells(Folder()),
-                               "-P",
-                               AsDaemonSpells(Folder()) + "/",
-                               "-e",
-                               "inject=" + call + ":" + fault + ":when=" + std::to_string(n)}}) {}
-
-    phone::Daemon& daemon() { return daemon_; }
-
-    /// Whether the daemon came as far as the fault.
-    [[nodiscard]] bool wasHit() {
-        if (daemon_.isRunning()) {
-            daemon_.signal(SIGTERM);
-        }
-        if (daemon_.waitForExit() != 0) {
-            return true;
-        }
-        std::string text;
-        return phone::Eventually([&] {
-                   std::ifstream file(kTrace);
-                   text.assign(std::istreambuf_iterator<char>(file), {});
-                   return text.find("+++ exited") != std::string::npos;
-               }) &&
-               text.find("(INJECTED)") != std::string::npos;
-    }
-
-private:
-    static constexpr const char* kTrace = "/run/trace";
-    phone::Daemon daemon_;
-};
-
-constexpr std::array kCalls{"openat",
-                            "fstat",
-                            "newfstatat",
-                            "read",
-                            "readlink",
-                            "unlinkat",
-                            "fchmod",
-                            "write",
-                            "fsync",
-                            "renameat",
-                            "renameat2",
-                            "linkat",
-                            "rename",
-                            "unlink"};
+/// What the faults are about.
+std::vector<std::string> TouchedPaths() {
+    return {TemporaryFile(),
+            DomainFile(),
+            AsDaemonSpells(DomainFile()),
+            Folder(),
+            AsDaemonSpells(Folder()),
+            AsDaemonSpells(Folder()) + "/"};
+}
 
 TEST_F(PreferenceWrites, AreOldOrNewWhateverCallIsTheLast) {
     int faults = 0;
-    for (const char* call : kCalls) {
+    for (const char* call : kFileCalls) {
         for (int n = 1; n < 20; ++n) {
             fs::remove_all(Folder());
             phone::ResetMobileHome();
             FillDomain();
-            FaultyDaemon faulty(call, n, "signal=SIGKILL");
+            FaultyDaemon faulty(TouchedPaths(), call, n, "signal=SIGKILL");
             const auto client = phone::Client::checkIn();
             const bool isAcknowledged = SetNumber(client, "number", 1) == 0;
             const bool wasHit = faulty.wasHit();
@@ -231,11 +180,11 @@ TEST_F(PreferenceWrites, AreOldOrNewWhateverCallIsTheLast) {
 
 TEST_F(PreferenceWrites, AreOldOrNewWhateverCallFails) {
     int faults = 0;
-    for (const char* call : kCalls) {
+    for (const char* call : kFileCalls) {
         for (int n = 1; n < 20; ++n) {
             phone::ResetMobileHome();
             FillDomain();
-            FaultyDaemon faulty(call, n, "error=EIO");
+            FaultyDaemon faulty(TouchedPaths(), call, n, "error=EIO");
             const auto client = phone::Client::checkIn();
             EXPECT_EQ(SetNumber(client, "number", 1), 0) << call << " " << n;
             const bool wasHit = faulty.wasHit();

@@ -212,13 +212,12 @@ const std::array<std::vector<std::int32_t>, 24> kDocumentedCodes{{
     {0}, {0}, {0}, {0}, {0}, {0},
     {0}, {0}, {0}, {0}, {0}, {0, 3, 6, 9},
 }};
+
 // clang-format on
-/// Of a routine that this build does not have.
-constexpr std::int32_t kNotSupported = 46;
 
 bool IsDocumentedCode(const RoutineLayout& layout, std::int32_t code) {
     const auto& codes = kDocumentedCodes.at(static_cast<std::size_t>(layout.id - 8683549));
-    return code == kNotSupported || std::ranges::find(codes, code) != codes.end();
+    return std::ranges::find(codes, code) != codes.end();
 }
 
 /// The bytes that must stand where they stand: all but the code or the descriptor's sizes, and the

@@ -11,22 +11,38 @@ enum class Takes { kNothing, kValue };
 struct KnownOption {
     std::string_view name;
     Takes takes;
-    /// The one command that it belongs to; empty for all.
-    std::string_view command;
+    /// The commands that it belongs to; none for all.
+    std::array<std::string_view, 3> commands{};
+
+    [[nodiscard]] bool belongsTo(std::string_view command) const {
+        return commands[0].empty() || std::ranges::find(commands, command) != commands.end();
+    }
+
+    [[nodiscard]] std::string commandNames() const {
+        const auto end = std::ranges::find(commands, std::string_view());
+        std::string names(commands[0]);
+        for (auto command = commands.begin() + 1; command < end; ++command) {
+            names += (command + 1 == end ? " or " : ", ") + std::string(*command);
+        }
+        return names;
+    }
 };
 
-constexpr std::array<KnownOption, 10> kKnownOptions{{
-    {"help", Takes::kNothing, ""},
-    {"version", Takes::kNothing, ""},
-    {"json", Takes::kNothing, ""},
-    {"group", Takes::kValue, ""},
-    {"service", Takes::kValue, ""},
-    {"complex", Takes::kNothing, "raw"},
-    {"claim-size", Takes::kValue, "raw"},
-    {"application", Takes::kNothing, "preferences get"},
-    {"plist", Takes::kNothing, "preferences get"},
-    {"type", Takes::kValue, "preferences set"},
-}};
+constexpr auto kKnownOptions = std::to_array<KnownOption>({
+    {"help", Takes::kNothing},
+    {"version", Takes::kNothing},
+    {"json", Takes::kNothing},
+    {"group", Takes::kValue},
+    {"service", Takes::kValue},
+    {"complex", Takes::kNothing, {"raw"}},
+    {"claim-size", Takes::kValue, {"raw"}},
+    {"application", Takes::kNothing, {"preferences get"}},
+    {"plist", Takes::kNothing, {"preferences get"}},
+    {"type", Takes::kValue, {"preferences set"}},
+    {"types", Takes::kValue, {"update-databases"}},
+    {"timeout", Takes::kValue, {"update-databases"}},
+    {"wait", Takes::kNothing, {"update-databases", "civic-address", "wan-ip"}},
+});
 
 /// The first word of commands that have two.
 constexpr std::string_view kCommandGroup = "preferences";
@@ -109,10 +125,10 @@ private:
 
     void checkCommands() {
         for (const auto& option : line_.options) {
-            const std::string_view command = FindKnownOption(option.name)->command;
-            if (!command.empty() && command != line_.command) {
+            const KnownOption& known = *FindKnownOption(option.name);
+            if (!known.belongsTo(line_.command)) {
                 fail("the option --" + std::string(option.name) + " belongs to the command " +
-                     std::string(command));
+                     known.commandNames());
             }
         }
     }

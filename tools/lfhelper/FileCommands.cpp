@@ -14,7 +14,10 @@ Answer AnswerOfFlag(std::int32_t code, std::int32_t isDone, const std::string& f
     Answer answer{.code = code};
     if (code == LF_MOBILE_HELPER_SUCCESS) {
         answer.fields.addLiteral("done", isDone != 0 ? "true" : "false");
-        answer.failure = isDone != 0 ? "" : failure + "; its log tells why";
+    }
+    if (code == LF_MOBILE_HELPER_SUCCESS && isDone == 0) {
+        answer.problem = {
+            .name = "NOT_DONE", .text = failure + "; its log tells why", .exitStatus = 1};
     }
     return answer;
 }
@@ -31,7 +34,7 @@ Preparation PrepareCopyFile(const CommandLine& line) {
             code, isDone, "the service did not copy " + name + " from " + from + " to " + to);
         answer.fields.add("sourceDirectory", from);
         answer.fields.add("destinationDirectory", to);
-        answer.fields.add("name", name);
+        answer.fields.add("item", name);
         return answer;
     }};
 }
@@ -56,7 +59,7 @@ Preparation PrepareMoveDirectory(const CommandLine& line) {
             code, isDone, "the service did not move " + source + " to " + to + " as " + name);
         answer.fields.add("source", source);
         answer.fields.add("destinationDirectory", to);
-        answer.fields.add("name", name);
+        answer.fields.add("item", name);
         return answer;
     }};
 }

@@ -10,9 +10,12 @@
 #include <vector>
 
 #include "Helper/Shared/Server/MessageLayouts.h"
+#include "tools/lfhelper/HeartbeatCommands.h"
 #include "tools/lfhelper/FileCommands.h"
 #include "tools/lfhelper/HexDump.h"
+#include "tools/lfhelper/LocationCommands.h"
 #include "tools/lfhelper/PreferenceCommands.h"
+#include "tools/lfhelper/UpdateCommands.h"
 
 namespace lfhelper {
 namespace {
@@ -138,7 +141,7 @@ Preparation PrepareRaw(const CommandLine& line) {
     return {.request = [message](LFMobileHelper* helper) { return SendAndDump(helper, message); }};
 }
 
-constexpr std::array<Subcommand, 13> kSubcommands{{
+constexpr auto kSubcommands = std::to_array<Subcommand>({
     {"check-in",
      "",
      "ask whether the service is there and takes this caller",
@@ -242,6 +245,104 @@ constexpr std::array<Subcommand, 13> kSubcommands{{
      2,
      2,
      PreparePreferencesRemove},
+    {"update-databases",
+     "[--types TYPES] [--wait] [--timeout SECONDS]",
+     "have the service databases brought up to date",
+     "Has the service compare the installed databases with the server's index, and install what\n"
+     "differs. The service takes the request and sends the outcome to the telephony daemon.\n"
+     "\n"
+     "  --types TYPES      names of gsm, umts, cdma, lte and scdma with commas between them, or "
+     "all\n"
+     "                     (the default), or a mask of their bits, such as 12 or 0xc\n"
+     "  --wait             ask for one type after the other, wait for each outcome in the "
+     "telephony\n"
+     "                     daemon's place, and show it. While the telephony daemon runs this "
+     "cannot\n"
+     "                     be: nothing is asked, and the exit status is 3.\n"
+     "  --timeout SECONDS  wait at most so long in all (default: 300)\n"
+     "\n"
+     "With --wait the exit status is 0 when each type was updated or needed no update, and 1 when\n"
+     "one failed or the time was over; then too the outcomes that came are shown. A type whose\n"
+     "entry in the index has no URL has no outcome at all.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper update-databases --types gsm,lte\n"
+     "  lfhelper update-databases --wait --timeout 60\n"
+     "  lfhelper update-databases --types gsm --wait --json\n",
+     0,
+     0,
+     PrepareUpdateDatabases},
+    {"country-code",
+     "",
+     "show the country code that is configured",
+     "Shows the country code of the geocoding services' configuration. That there is none is no\n"
+     "failure of the service: the exit status is 4 then.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper country-code\n"
+     "  lfhelper --json country-code\n",
+     0,
+     0,
+     PrepareCountryCode},
+    {"civic-address",
+     "[--wait] LATITUDE LONGITUDE",
+     "have the civic address of a place sent to the telephony daemon",
+     "Asks for the country code, state, city and postal code of a place, in degrees. The service\n"
+     "takes the request and sends the result to the telephony daemon, within about 5 seconds.\n"
+     "\n"
+     "  --wait    wait for the result in the telephony daemon's place, at most 10 seconds, and "
+     "show\n"
+     "            it. While the telephony daemon runs this cannot be: nothing is asked, and the\n"
+     "            exit status is 3. It is 1 when no result comes.\n"
+     "\n"
+     "A number like -.5 goes behind --, or is written -0.5.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper civic-address 51.5007 -0.1246\n"
+     "  lfhelper civic-address --wait --json 51.5007 -0.1246\n",
+     2,
+     2,
+     PrepareCivicAddress},
+    {"wan-ip",
+     "[--wait]",
+     "have this device's public address sent to the telephony daemon",
+     "Asks for the address under which this device is seen from the network outside. The service\n"
+     "takes the request and sends the result to the telephony daemon, within about 5 seconds; an\n"
+     "empty address means that it could not be found out.\n"
+     "\n"
+     "  --wait    wait for the result in the telephony daemon's place, at most 10 seconds, and "
+     "show\n"
+     "            it. While the telephony daemon runs this cannot be: nothing is asked, and the\n"
+     "            exit status is 3. It is 1 when no result comes.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper wan-ip\n"
+     "  lfhelper wan-ip --wait\n",
+     0,
+     0,
+     PrepareWanIp},
+    {"heartbeat",
+     "STATE",
+     "start or stop the echo requests over the cellular interface",
+     "With STATE \"on\" the service sends an echo request over pdp_ip0 at once and then every two\n"
+     "seconds, over whatever interface leads to its host while there is no pdp_ip0, until STATE "
+     "is\n"
+     "\"off\". It answers at once; what becomes of the requests is not told anywhere.\n"
+     "\n"
+     "A heartbeat belongs to the service and not to the caller: it goes on when this command "
+     "ends,\n"
+     "and keeps the service from leaving. \"off\" ends that, whoever says it. Each \"on\" while "
+     "it is\n"
+     "on begins the rhythm anew, and keeps the service for good: then it ends when it is told to "
+     "end\n"
+     "(SIGTERM), and no more by itself. \"off\" while it is off changes nothing.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper heartbeat on\n"
+     "  lfhelper heartbeat off\n",
+     1,
+     1,
+     PrepareHeartbeat},
     {"copy-file",
      "SOURCE-DIRECTORY DESTINATION-DIRECTORY NAME",
      "copy a file into a carrier-bundle directory",
@@ -331,7 +432,7 @@ constexpr std::array<Subcommand, 13> kSubcommands{{
      1,
      2,
      PrepareRaw},
-}};
+});
 
 }  // namespace
 

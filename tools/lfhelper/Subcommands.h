@@ -14,6 +14,13 @@
 
 namespace lfhelper {
 
+/// What went wrong on this side although the service did not refuse.
+struct Problem {
+    std::string name{};  ///< for programs
+    std::string text{};  ///< for people; empty when there is no problem
+    int exitStatus = 0;
+};
+
 struct Answer {
     std::int32_t code = LF_MOBILE_HELPER_SUCCESS;
     /// For people, ending in a newline; when it is empty, the code says all.
@@ -22,8 +29,7 @@ struct Answer {
     JsonObject fields{};
     /// For people, when the service found nothing where it was asked to look; else empty.
     std::string absence{};
-    /// For people, when the service answered that it did not do what it was asked for; else empty.
-    std::string failure{};
+    Problem problem{};
 };
 
 using Request = std::function<Answer(LFMobileHelper* helper)>;

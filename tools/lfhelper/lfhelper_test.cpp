@@ -167,8 +167,9 @@ TEST_F(LfhelperTest, TellsProgramsThatItWasNotDone) {
         runAnswered("--json copy-archive source destination", NumberReply(8683571, 0));
     EXPECT_EQ(outcome.exitStatus, 1);
     EXPECT_EQ(outcome.output,
-              "{\"command\":\"copy-archive\",\"exitStatus\":1,\"code\":0,\"name\":\"SUCCESS\","
-              "\"meaning\":\"success\",\"done\":false,\"source\":\"source\",\"destination\":"
+              "{\"command\":\"copy-archive\",\"exitStatus\":1,\"code\":null,\"name\":\"NOT_DONE\","
+              "\"meaning\":\"the service did not copy all of source to destination; its log "
+              "tells why\",\"done\":false,\"source\":\"source\",\"destination\":"
               "\"destination\"}\n");
     EXPECT_EQ(requestText(32) + " " + requestText(288), "source destination");
 }
@@ -385,6 +386,28 @@ TEST_F(LfhelperTest, ShowsWhatStandsBehindTheFieldsOfARawReply) {
     EXPECT_EQ(Get<std::int32_t>(request, 20), 8683568);
     EXPECT_TRUE(Contains(outcome.output, "  0024  44 45 00 ")) << outcome.output;
     EXPECT_TRUE(Contains(outcome.output, "|DE..............|\n"));
+}
+
+TEST_F(LfhelperTest, SwitchesTheHeartbeat) {
+    for (const bool isOn : {true, false}) {
+        Service another;
+        another.play([this](Service& self) {
+            const Session session = self.checkIn();
+            request = Receive(session.port.get()).bytes;
+            Send(session.port.get(), SimpleReply(8683562, 0));
+        });
+        const auto outcome = RunProgram(another, isOn ? "heartbeat on" : "heartbeat off");
+        EXPECT_EQ(outcome.exitStatus, 0) << outcome.output;
+        ASSERT_EQ(request.size(), 36U);
+        EXPECT_EQ(request[32], isOn ? 1 : 0);
+    }
+}
+
+TEST_F(LfhelperTest, TellsProgramsOfTheHeartbeat) {
+    const auto outcome = runAnswered("--json heartbeat on", SimpleReply(8683562, 5));
+    EXPECT_EQ(outcome.exitStatus, 1);
+    EXPECT_TRUE(Contains(outcome.output, "\"state\":\"on\"")) << outcome.output;
+    EXPECT_TRUE(Contains(outcome.output, "\"code\":5"));
 }
 
 TEST_F(LfhelperTest, ShowsARawBulkReply) {

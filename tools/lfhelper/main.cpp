@@ -107,12 +107,13 @@ int Fail(const CommandLine& line, ExitStatus status, std::string_view name, std:
     return status;
 }
 
-ExitStatus ExitStatusOf(const Answer& answer) {
+int ExitStatusOf(const Answer& answer) {
+    if (!answer.problem.text.empty()) {
+        return answer.problem.exitStatus;
+    }
     switch (answer.code) {
         case LF_MOBILE_HELPER_SUCCESS:
-            return !answer.failure.empty()  ? kFailure
-                   : answer.absence.empty() ? kSuccess
-                                            : kNoValue;
+            return answer.absence.empty() ? kSuccess : kNoValue;
         case LF_MOBILE_HELPER_NOT_ENTITLED:
         case LF_MOBILE_HELPER_ERROR_NO_SERVICE:
         case LF_MOBILE_HELPER_ERROR_NOT_A_SERVICE:
@@ -126,13 +127,26 @@ ExitStatus ExitStatusOf(const Answer& answer) {
     }
 }
 
+/// Its code, or what went wrong on this side.
+JsonObject OutcomeForPrograms(const Answer& answer) {
+    JsonObject object;
+    if (answer.problem.text.empty()) {
+        object.add("code", std::int64_t{answer.code});
+        object.add("name", LFMobileHelperErrorName(answer.code));
+        object.add("meaning", LFMobileHelperErrorString(answer.code));
+    } else {
+        object.addNull("code");
+        object.add("name", answer.problem.name);
+        object.add("meaning", answer.problem.text);
+    }
+    return object;
+}
+
 void PrintAnswerForPrograms(const Subcommand& subcommand, const Answer& answer) {
     JsonObject object;
     object.add("command", subcommand.name);
     object.add("exitStatus", std::int64_t{ExitStatusOf(answer)});
-    object.add("code", std::int64_t{answer.code});
-    object.add("name", LFMobileHelperErrorName(answer.code));
-    object.add("meaning", LFMobileHelperErrorString(answer.code));
+    object.append(OutcomeForPrograms(answer));
     object.append(answer.fields);
     Print(stdout, object.toString() + "\n");
 }
@@ -141,8 +155,10 @@ void PrintAnswerForPeople(const Subcommand& subcommand, const Answer& answer) {
     Print(stdout, answer.text);
     const std::string name(subcommand.name);
     const std::string meaning = LFMobileHelperErrorString(answer.code);
-    if (!answer.absence.empty() || !answer.failure.empty()) {
-        PrintError(name + ": " + answer.absence + answer.failure);
+    if (!answer.problem.text.empty()) {
+        PrintError(name + ": " + answer.problem.text);
+    } else if (!answer.absence.empty()) {
+        PrintError(name + ": " + answer.absence);
     } else if (answer.code == LF_MOBILE_HELPER_SUCCESS && answer.text.empty()) {
         Print(stdout, name + ": " + meaning + "\n");
     } else if (answer.code != LF_MOBILE_HELPER_SUCCESS) {

@@ -5,6 +5,7 @@
 #include <bit>
 #include <limits>
 #include <utility>
+#include <vector>
 
 #include "Helper/Shared/Server/CheckInProtocol.h"
 #include "Helper/Shared/Server/EntitlementCache.h"
@@ -32,6 +33,24 @@ bool OpenService(MobileHelperServer& server, std::string_view serviceName) {
     return true;
 }
 
+/// The records of destroyed servers. A queue's thread may still come with a hold to take or release
+/// while the process ends, so their memory stays; it serves the next server, if there is one.
+std::vector<std::unique_ptr<MobileHelperServer>>& RetiredRecords() {
+    static auto& records = *new std::vector<std::unique_ptr<MobileHelperServer>>;
+    return records;
+}
+
+std::unique_ptr<MobileHelperServer> NewRecord() {
+    if (RetiredRecords().empty()) {
+        return std::make_unique<MobileHelperServer>();
+    }
+    auto record = std::move(RetiredRecords().back());
+    RetiredRecords().pop_back();
+    std::destroy_at(record.get());
+    std::construct_at(record.get());
+    return record;
+}
+
 void DropReceiveRight(mach_port_t port) {
     // Failing leaves nothing to release: the name is gone then.
     (void)mach_port_mod_refs(port, MachPortRight::kReceive, -1);
@@ -50,7 +69,7 @@ void IdleTimerFired(MobileHelperServer* server) {
 MobileHelperServer* MobileHelperServerCreate(std::string_view serviceName,
                                              const MigSubsystem& requestSubsystem) {
     ServerPortTableCreate();
-    auto server = std::make_unique<MobileHelperServer>();
+    auto server = NewRecord();
     if (OpenService(*server, serviceName)) {
         server->requestSubsystem = &requestSubsystem;
         return server.release();
@@ -111,7 +130,7 @@ void MobileHelperServerDestroy(MobileHelperServer* server) {
             RemoveClient(watchPortObject.get(), privatePort, server);
         }
     }
-    delete server;
+    RetiredRecords().emplace_back(server);
 }
 
 std::uint32_t ServerHoldAcquire(MobileHelperServer* server) {

@@ -182,6 +182,16 @@ TEST_F(HelperServerHolds, DoNotNoticeABitThatIsNotHeld) {
     EXPECT_EQ(server->idleTimer, nullptr);
 }
 
+TEST_F(HelperServerHolds, MayBeTakenAndReleasedWhenTheServerIsGone) {
+    MobileHelperServer* const gone = std::exchange(server, nullptr);
+    MobileHelperServerDestroy(gone);
+    EXPECT_TRUE(ServerHoldRelease(gone, ServerHoldAcquire(gone)));
+    EXPECT_EQ(ServerHoldAcquire(gone), 1U);
+    server = MobileHelperServerCreate(kServiceName, kRequestSubsystem);
+    ASSERT_NE(server, nullptr);
+    EXPECT_EQ(server->holdMask, 0U) << "the next server begins without holds";
+}
+
 TEST_F(HelperServerHolds, ReleasingARefusedTokenArmsNothing) {
     EXPECT_FALSE(ServerHoldRelease(server, 0));
     EXPECT_FALSE(ServerHoldRelease(server, 6));
