@@ -139,8 +139,8 @@ TEST_F(FileRoutines, GiveAwayALinkAndNotWhatItLeadsTo) {
 TEST_F(FileRoutines, GiveNoLinkOfTheMobileUserToRoot) {
     for (const std::string& from : {kNear, kElsewhere}) {
         fs::create_symlink("/etc", from + "/tree/deep/etc");
-        for (const std::string& link : {from + "/tree/deep/etc", from + "/tree/link"}) {
-            ASSERT_EQ(lchown(link.c_str(), phone::kMobileUser, phone::kMobileUser), 0);
+        for (const char* item : {"/tree/deep/etc", "/tree/link", "/tree/file"}) {
+            ASSERT_EQ(lchown((from + item).c_str(), phone::kMobileUser, phone::kMobileUser), 0);
         }
         const std::string name = from == kNear ? "near" : "elsewhere";
         expectDone(true, kCopyLogDirectory, {from + "/tree"});
