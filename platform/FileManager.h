@@ -26,12 +26,13 @@ using LeaveOutHandler = std::function<bool(const std::string& subpath, int error
 
 /// Copies an item to a path where nothing is; EEXIST when something is there.
 ///
-/// The copy belongs to the process. Permissions, times, user.* attributes, holes, symbolic links
-/// (dangling ones too) and hard links inside the tree are kept; set-id bits, security.* and
-/// trusted.* attributes, access control lists and flags such as the immutable one are not. FIFOs,
-/// sockets and device nodes inside a tree are left out without a word, or told to the handler with
-/// EOPNOTSUPP; an item that is one is EOPNOTSUPP. A tree into itself is EINVAL. Without a handler
-/// the first failure inside a tree is that of the copy.
+/// The copy belongs to the process, but for links: each stays whose it was, since a link of root's
+/// is one that leads us. Permissions, times, user.* attributes, holes, symbolic links (dangling
+/// ones too) and hard links inside the tree are kept; set-id bits, security.* and trusted.*
+/// attributes, access control lists and flags such as the immutable one are not. FIFOs, sockets and
+/// device nodes inside a tree are left out without a word, or told to the handler with EOPNOTSUPP;
+/// an item that is one is EOPNOTSUPP. A tree into itself is EINVAL. Without a handler the first
+/// failure inside a tree is that of the copy.
 ///
 /// The path shows nothing until the copy is complete: a copy that fails is removed, and one that
 /// the end of the process interrupts lies beside under a name of ours, which the next copy into

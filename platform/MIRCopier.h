@@ -45,8 +45,9 @@ void MIRCopierSetFatalFileErrorHandler(MIRCopier* copier, MIRCopierFatalErrorHan
 /// A file takes the place of the destination, or goes inside it if that is a directory; a link to a
 /// file is copied as a link. Both paths are resolved by the rule of PathAccess, and what they lead
 /// to is held open: nothing outside of the destination is touched, whatever is moved or linked
-/// below it meanwhile. What is made belongs to this process; copies keep what those of
-/// FileManagerCopyItem keep.
+/// below it meanwhile. Copies are what those of FileManagerCopyItem are. What is made of an archive
+/// belongs to this process, but for links: they belong to the owner of the destination, since a
+/// link of root's is one that leads us.
 ///
 /// Of an archive only regular files, directories and symbolic links are expanded, with the modes
 /// that 0755 leaves, and each file is complete or not there. An entry is left out or ends the copy,

@@ -58,7 +58,8 @@ public:
     /// none is opened; EFBIG when there are more than `most`. Never waits for another process.
     [[nodiscard]] int read(std::size_t most, std::vector<std::byte>* contents) const;
 
-    /// lchown(2); what is all ones stays as it is.
+    /// lchown(2); what is all ones stays as it is. A link is never given to root: whoever wrote it
+    /// would lead us from then on. It stays whose it is, and that is a success.
     [[nodiscard]] int setOwner(std::uint32_t uid, std::uint32_t gid) const;
 
     /// chmod(2) of the item itself; a link has no mode of its own: EOPNOTSUPP.

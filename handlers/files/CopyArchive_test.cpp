@@ -1,6 +1,6 @@
 #include <cerrno>
 
-#include "handlers/files/FileTest.h"
+#include "handlers/files/FileRoutine_test.h"
 #include "platform/sim/SimArchives.h"
 
 using platform::PropertyList;

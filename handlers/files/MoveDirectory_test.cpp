@@ -1,4 +1,4 @@
-#include "handlers/files/FileTest.h"
+#include "handlers/files/FileRoutine_test.h"
 
 namespace {
 

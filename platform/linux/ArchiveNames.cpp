@@ -57,7 +57,7 @@ std::optional<ArchiveError> CheckSteps(const std::vector<std::string>& steps) {
     if (std::ranges::any_of(steps, [](const auto& step) { return step.size() > NAME_MAX; })) {
         return ArchiveError{ENAMETOOLONG, "a part of the name is too long"};
     }
-    if (std::ranges::find(steps, kUnfinishedName) != steps.end()) {
+    if (std::ranges::any_of(steps, [](const auto& s) { return s.starts_with(kUnfinishedName); })) {
         return ArchiveError{EINVAL, "the name is reserved"};
     }
     return std::nullopt;

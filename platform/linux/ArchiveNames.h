@@ -10,8 +10,9 @@
 
 namespace platform {
 
-/// Where files grow until they are complete. No entry may have this name.
+/// Where files and links grow until they are complete. No entry may have such a name.
 inline constexpr const char* kUnfinishedName = ".linefold-unfinished";
+inline constexpr const char* kUnfinishedLinkName = ".linefold-unfinished-link";
 
 /// The steps of an entry's name below the folder that it is expanded into: none for the folder
 /// itself ("./"). "." and doubled slashes mean nothing; a slash at the end is left out.

@@ -7,6 +7,7 @@
 #include <cerrno>
 
 #include "platform/linux/ArchiveNames.h"
+#include "platform/linux/PrivateFolder.h"
 
 namespace platform {
 namespace {
@@ -70,6 +71,7 @@ int ExpandedTree::makeFolder(const Steps& steps, mode_t mode) {
 }
 
 int ExpandedTree::makeLink(const Steps& steps, const std::string& target) {
+    constexpr const char* kLink = "link";
     OwnedFd parent;
     if (steps.empty()) {
         return EISDIR;
@@ -78,16 +80,36 @@ int ExpandedTree::makeLink(const Steps& steps, const std::string& target) {
         error != 0) {
         return error;
     }
-    (void)unlinkat(parent.get(), kUnfinishedName, 0);  // of a process that was killed
-    if (symlinkat(target.c_str(), parent.get(), kUnfinishedName) != 0) {
+    PrivateFolder place;
+    if (const int error = place.make(parent.get(), kUnfinishedLinkName); error != 0) {
+        return error;
+    }
+    const int made = place.file().get();
+    (void)unlinkat(made, kLink, 0);  // of a process that was killed
+    if (symlinkat(target.c_str(), made, kLink) != 0) {
         return errno;
     }
-    const int error =
-        ErrorOf(renameat(parent.get(), kUnfinishedName, parent.get(), steps.back().c_str()));
+    int error = giveLink(made, kLink);
+    if (error == 0) {
+        error = ErrorOf(renameat(made, kLink, parent.get(), steps.back().c_str()));
+    }
     if (error != 0) {
-        (void)unlinkat(parent.get(), kUnfinishedName, 0);
+        (void)unlinkat(made, kLink, 0);
     }
     return error;
+}
+
+/// A link of root's is one that leads us, and this one is a stranger's: it belongs to whom the
+/// destination belongs.
+int ExpandedTree::giveLink(int folder, const char* name) const {
+    struct stat status {};
+
+    if (fstat(folder_, &status) != 0) {
+        return errno;
+    }
+    return status.st_uid == geteuid()
+               ? 0
+               : ErrorOf(fchownat(folder, name, status.st_uid, status.st_gid, AT_SYMLINK_NOFOLLOW));
 }
 
 UnfinishedFile::~UnfinishedFile() {

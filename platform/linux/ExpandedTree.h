@@ -26,7 +26,8 @@ public:
     /// A folder; one that is there already stays as it is, with its mode.
     [[nodiscard]] int makeFolder(const Steps& steps, mode_t mode);
 
-    /// A symbolic link in place of what is there, unless that is a folder.
+    /// A symbolic link in place of what is there, unless that is a folder. It belongs to whom the
+    /// tree's folder belongs.
     [[nodiscard]] int makeLink(const Steps& steps, const std::string& target);
 
     /// How many folders were made on the way to what was asked for.
@@ -35,6 +36,7 @@ public:
 private:
     friend class UnfinishedFile;
 
+    [[nodiscard]] int giveLink(int folder, const char* name) const;
     [[nodiscard]] int openFolder(std::span<const std::string> steps, OwnedFd* folder);
 
     const int folder_;

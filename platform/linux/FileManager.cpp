@@ -11,6 +11,7 @@
 
 #include "platform/linux/PathState.h"
 #include "platform/linux/PathWalk.h"
+#include "platform/linux/PrivateFolder.h"
 #include "platform/linux/ReplacementFile.h"
 #include "platform/linux/TreeCopy.h"
 #include "platform/linux/TreeRemoval.h"
@@ -30,15 +31,16 @@ std::string TemporaryName(const char* purpose) {
     return std::string(".linefold-mobile-helper.") + purpose + "-" + std::to_string(number);
 }
 
-/// Beside the final name until it is complete; goes with the object unless it took its place.
+/// Beside the final name until it is complete, where nobody sees it; goes with the object unless it
+/// took its place.
 class UnfinishedCopy {
 public:
     explicit UnfinishedCopy(const OwnedFd& folder)
-        : folder_(folder), name_(TemporaryName("copy")) {}
+        : folder_(folder), privateName_(TemporaryName("copy")) {}
 
     ~UnfinishedCopy() {
         if (isMade_) {
-            (void)RemoveTree(folder_, name_);  // what stays is removed by the next copy
+            (void)RemoveTree(place_.file(), kName);  // what stays is removed by the next copy
         }
     }
 
@@ -48,16 +50,22 @@ public:
     [[nodiscard]] int make(const ItemPlace& source,
                            Folder::Identity* sourceFolder,
                            const LeaveOutHandler& leavesOut) {
-        if (const int error = RemoveTree(folder_, name_); error != 0 && error != ENOENT) {
+        if (const int error = RemoveTree(folder_, privateName_); error != 0 && error != ENOENT) {
+            return error;
+        }
+        if (const int error = place_.make(folder_.get(), privateName_); error != 0) {
             return error;
         }
         isMade_ = true;
-        return CopyTree(source, {.folder = folder_, .name = name_}, sourceFolder, leavesOut);
+        return CopyTree(source, {.folder = place_.file(), .name = kName}, sourceFolder, leavesOut);
     }
 
     [[nodiscard]] int takePlace(const std::string& name) {
-        if (renameat2(
-                folder_.get(), name_.c_str(), folder_.get(), name.c_str(), RENAME_NOREPLACE) != 0) {
+        if (renameat2(place_.file().get(),
+                      kName.c_str(),
+                      folder_.get(),
+                      name.c_str(),
+                      RENAME_NOREPLACE) != 0) {
             return errno;
         }
         isMade_ = false;
@@ -65,8 +73,11 @@ public:
     }
 
 private:
+    static inline const std::string kName = "copy";
+
     const OwnedFd& folder_;
-    const std::string name_;
+    const std::string privateName_;
+    PrivateFolder place_;
     bool isMade_ = false;
 };
 

@@ -53,35 +53,6 @@ std::string Read(const std::string& path) {
     return {std::istreambuf_iterator<char>(file), {}};
 }
 
-std::string LineOf(const std::string& path, const std::string& shown) {
-    struct stat status {};
-
-    EXPECT_EQ(lstat(path.c_str(), &status), 0);
-    EXPECT_EQ(status.st_uid, 0U);
-    constexpr const char* kTypes = "?pc?d?b?f?l?s???";
-    std::array<char, 8> mode{};
-    (void)std::snprintf(mode.data(), mode.size(), "%04o", status.st_mode & 07777U);
-    std::string contents = S_ISREG(status.st_mode)   ? Read(path)
-                           : S_ISLNK(status.st_mode) ? fs::read_symlink(path).string()
-                                                     : "";
-    return std::string(1, kTypes[status.st_mode >> 12]) + " " + mode.data() + " " + shown + " " +
-           contents;
-}
-
-/// Everything below a folder, by path.
-Lines TreeAt(const std::string& folder) {
-    std::map<std::string, std::string> lines;
-    for (const auto& entry : fs::recursive_directory_iterator(folder)) {
-        const std::string shown = entry.path().string().substr(folder.size() + 1);
-        lines[shown] = LineOf(entry.path(), shown);
-    }
-    Lines tree;
-    for (auto& [path, line] : lines) {
-        tree.push_back(std::move(line));
-    }
-    return tree;
-}
-
 class ArchiveCopier : public testing::Test {
 protected:
     ArchiveCopier() {
@@ -114,7 +85,7 @@ TEST_F(ArchiveCopier, ExpandsAnArchiveIntoAFolderThatItMakes) {
                                  zip::File("made/on/the/way", "x", 0600)})),
               0);
     EXPECT_EQ(calls, Lines());
-    EXPECT_EQ(TreeAt(kDestination),
+    EXPECT_EQ(zip::Listing(kDestination),
               (Lines{"d 0755 Example.bundle ",
                      "f 0644 Example.bundle/Info.plist <plist/>",
                      "l 0777 Example.bundle/link Info.plist",
@@ -130,12 +101,13 @@ TEST_F(ArchiveCopier, IsNotHurtByHostileArchives) {
         calls.clear();
         fs::remove_all(kDestination);
         const int result = expand(archive.bytes);
-        Lines outcome = TreeAt(kDestination);
+        Lines outcome = zip::Listing(kDestination);
         outcome.insert(outcome.end(), calls.begin(), calls.end());
         EXPECT_EQ(outcome, archive.outcome) << archive.name;
         const bool isFatal = !calls.empty() && calls.back().starts_with("fatal");
         EXPECT_EQ(result != 0, isFatal) << archive.name;
-        EXPECT_EQ(TreeAt(kPlace).size(), 2 + TreeAt(kDestination).size()) << archive.name;
+        EXPECT_EQ(zip::Listing(kPlace).size(), 2 + zip::Listing(kDestination).size())
+            << archive.name;
     }
 }
 
@@ -194,7 +166,7 @@ TEST_F(ArchiveCopier, LeavesWhatIsInTheDestinationButForFilesOfTheSameName) {
                                  zip::File("folder/new", "new"),
                                  zip::File("replaced", "new")})),
               0);
-    EXPECT_EQ(TreeAt(kDestination),
+    EXPECT_EQ(zip::Listing(kDestination),
               (Lines{"d 0700 folder ",
                      "f 0644 folder/kept kept",
                      "f 0644 folder/new new",
@@ -207,7 +179,7 @@ TEST_F(ArchiveCopier, KeepsTheOldFileWhenTheNewOneIsDamaged) {
     zip::Entry damaged = zip::File("file", "new");
     damaged.crc = 1;
     EXPECT_EQ(expand(zip::Write({damaged})), 0);
-    EXPECT_EQ(TreeAt(kDestination), Lines{"f 0644 file old"});
+    EXPECT_EQ(zip::Listing(kDestination), Lines{"f 0644 file old"});
     EXPECT_EQ(calls, Lines{"left out 84 file"});
 }
 
@@ -219,9 +191,36 @@ TEST_F(ArchiveCopier, GoesThroughNoLinkInTheDestination) {
     fs::create_symlink("../outside/file", kDestination + "/file");
     EXPECT_EQ(expand(zip::Write({zip::File("link/new", "evil"), zip::File("file", "new")})), 0);
     EXPECT_EQ(calls, Lines{"left out 20 link/new"});
-    EXPECT_EQ(TreeAt(kPlace + "/outside"), Lines{"f 0644 file old"});
+    EXPECT_EQ(zip::Listing(kPlace + "/outside"), Lines{"f 0644 file old"});
     EXPECT_EQ(Read(kDestination + "/file"), "new");
     EXPECT_FALSE(fs::is_symlink(kDestination + "/file"));
+}
+
+/// A link of root's is one that leads us.
+TEST_F(ArchiveCopier, GivesLinksOfAnArchiveToTheOwnerOfTheDestination) {
+    fs::create_directories(kDestination);
+    ASSERT_EQ(chown(kDestination.c_str(), 501, 501), 0);
+    const std::string archive =
+        zip::Write({zip::Link("a/link", "../b"), zip::File("b", "x"), zip::Link("link", "b")});
+    for (int time = 0; time < 2; ++time) {
+        EXPECT_EQ(expand(archive), 0);
+        EXPECT_EQ(
+            zip::Listing(kDestination),
+            (Lines{
+                "d 0755 a ", "l 0777 a/link ../b of 501", "f 0644 b x", "l 0777 link b of 501"}));
+    }
+}
+
+TEST_F(ArchiveCopier, LeavesLinksThatItCopiesToTheirOwners) {
+    fs::create_directories(kPlace + "/tree/folder");
+    for (const char* link : {"/tree/folder/link", "/tree/link"}) {
+        fs::create_symlink("/etc", kPlace + link);
+        ASSERT_EQ(lchown((kPlace + link).c_str(), 501, 501), 0);
+    }
+    EXPECT_EQ(copy(kPlace + "/tree"), 0);
+    EXPECT_EQ(
+        zip::Listing(kDestination),
+        (Lines{"d 0755 folder ", "l 0777 folder/link /etc of 501", "l 0777 link /etc of 501"}));
 }
 
 TEST_F(ArchiveCopier, KeepsTheTimesOfFiles) {
@@ -236,7 +235,7 @@ TEST_F(ArchiveCopier, StopsWhenTheHandlerDoesNotSkip) {
         expand(zip::Write({zip::File("a", "x"), zip::File("../b", "x"), zip::File("c", "x")})),
         EPERM);
     EXPECT_EQ(calls, Lines{"left out 1 ../b"});
-    EXPECT_EQ(TreeAt(kDestination), Lines{"f 0644 a x"});
+    EXPECT_EQ(zip::Listing(kDestination), Lines{"f 0644 a x"});
 }
 
 TEST_F(ArchiveCopier, NeedsNoHandlers) {
@@ -271,7 +270,7 @@ TEST_F(ArchiveCopier, CopiesAFileToThePathOrIntoTheFolder) {
     for (const char* place : {"/destination", "/destination/", "/copy", "/destination/file"}) {
         EXPECT_EQ(copy(kPlace + "/file", kPlace + place), 0) << place;
     }
-    EXPECT_EQ(TreeAt(kDestination), Lines{"f 0644 file contents"});
+    EXPECT_EQ(zip::Listing(kDestination), Lines{"f 0644 file contents"});
     std::array<char, 8> value{};
     EXPECT_EQ(getxattr((kPlace + "/copy").c_str(), "user.kept", value.data(), value.size()), 5);
     EXPECT_EQ(calls, Lines());
@@ -286,7 +285,7 @@ TEST_F(ArchiveCopier, PutsAFileInPlaceOfAnotherOrOfALink) {
         EXPECT_FALSE(fs::is_symlink(kPlace + place));
         EXPECT_EQ(Read(kPlace + place), "new");
     }
-    EXPECT_EQ(TreeAt(kPlace).size(), 3U);
+    EXPECT_EQ(zip::Listing(kPlace).size(), 3U);
 }
 
 /// A folder with what a copy keeps and what it leaves out.
@@ -315,7 +314,7 @@ TEST_F(ArchiveCopier, CopiesWhatADirectoryContains) {
         calls.clear();
         fs::remove_all(kDestination);
         EXPECT_EQ(copy(kPlace + source, kDestination + "/made"), 0);
-        EXPECT_EQ(TreeAt(kDestination + "/made"), kCopyOfTree);
+        EXPECT_EQ(zip::Listing(kDestination + "/made"), kCopyOfTree);
         std::ranges::sort(calls);
         EXPECT_EQ(calls, (Lines{"left out 95 deep/fifo", "left out 95 fifo"}));
     }
@@ -332,7 +331,7 @@ TEST_F(ArchiveCopier, MergesADirectoryIntoAnother) {
     Lines expected = kCopyOfTree;
     expected[0] = "d 0755 archive.zip ";
     expected.insert(expected.end() - 1, "f 0644 deep/kept kept");
-    EXPECT_EQ(TreeAt(kDestination), expected);
+    EXPECT_EQ(zip::Listing(kDestination), expected);
     std::ranges::sort(calls);
     EXPECT_EQ(calls,
               (Lines{"left out 21 archive.zip", "left out 95 deep/fifo", "left out 95 fifo"}));
@@ -344,7 +343,7 @@ TEST_F(ArchiveCopier, StopsADirectoryWhenTheHandlerDoesNotSkip) {
     answer = 1;
     EXPECT_EQ(copy(kPlace + "/tree"), EOPNOTSUPP);
     EXPECT_EQ(calls, Lines{"left out 95 folder/fifo"});
-    EXPECT_EQ(TreeAt(kDestination), Lines()) << "nothing half done";
+    EXPECT_EQ(zip::Listing(kDestination), Lines()) << "nothing half done";
 }
 
 TEST_F(ArchiveCopier, DoesNotCopyTheCopyOfADirectoryIntoItself) {
@@ -352,11 +351,10 @@ TEST_F(ArchiveCopier, DoesNotCopyTheCopyOfADirectoryIntoItself) {
     WriteFile(kPlace + "/tree/file", "x");
     EXPECT_EQ(copy(kPlace + "/tree", kPlace + "/tree/folder"), 0);
     EXPECT_EQ(calls.size(), 1U) << "what the copy was while it grew";
-    EXPECT_EQ(TreeAt(kPlace + "/tree"),
-              (Lines{"f 0644 file x",
-                     "d 0755 folder ",
-                     "f 0644 folder/file x",
-                     "d 0755 folder/folder "}));
+    EXPECT_EQ(
+        zip::Listing(kPlace + "/tree"),
+        (Lines{
+            "f 0644 file x", "d 0755 folder ", "f 0644 folder/file x", "d 0755 folder/folder "}));
 }
 
 TEST_F(ArchiveCopier, OpensNoSourceThatIsNeitherFileNorDirectory) {
@@ -389,7 +387,7 @@ TEST_F(ArchiveCopier, NeedsASourceAndAPlace) {
         EXPECT_EQ(copy(source, ""), ENOENT);
     }
     EXPECT_EQ(calls.size(), 10U);
-    EXPECT_EQ(TreeAt(kPlace).size(), 3U);
+    EXPECT_EQ(zip::Listing(kPlace).size(), 3U);
 }
 
 TEST_F(ArchiveCopier, FollowsNoLinkOfTheMobileUserToWhatIsNot) {
@@ -403,7 +401,7 @@ TEST_F(ArchiveCopier, FollowsNoLinkOfTheMobileUserToWhatIsNot) {
         EXPECT_EQ(copy(source, kPlace + "/link/below"), EPERM) << source;
     }
     EXPECT_EQ(copy(kPlace + "/link"), EPERM);
-    EXPECT_EQ(TreeAt(kPlace + "/roots"), Lines());
+    EXPECT_EQ(zip::Listing(kPlace + "/roots"), Lines());
 }
 
 }  // namespace

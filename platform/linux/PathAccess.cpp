@@ -184,8 +184,12 @@ int PathAccess::read(std::size_t most, std::vector<std::byte>* contents) const {
 
 int PathAccess::setOwner(std::uint32_t uid, std::uint32_t gid) const {
     const Opened item = OpenItem(*state_);
-    return item.error != 0 ? item.error
-                           : ErrorOf(fchownat(item.file.get(), "", uid, gid, AT_EMPTY_PATH));
+    FileStatus status;
+    if (const int error = StatusOf(item, state_->endsInSlash, &status); error != 0) {
+        return error;
+    }
+    const bool wouldVouch = S_ISLNK(status.mode) && uid == 0;
+    return wouldVouch ? 0 : ErrorOf(fchownat(item.file.get(), "", uid, gid, AT_EMPTY_PATH));
 }
 
 int PathAccess::setMode(std::uint32_t mode) const {

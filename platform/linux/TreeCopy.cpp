@@ -108,7 +108,7 @@ private:
     const ItemPlace copy_;
     const LeaveOutHandler& leavesOut_;
     std::vector<Level> levels_;
-    Folder::Identity top_;  ///< of the copy
+    Folder::Identity place_;  ///< of the folder that the copy is made in
     PendingFolders pending_;
     ModeMask mask_;
     HardLinks hardLinks_;
@@ -131,6 +131,10 @@ int TreeCopy::copy(Folder::Identity* sourceFolder) {
         default:
             return EOPNOTSUPP;
     }
+    if (fstat(copy_.folder.get(), &status) != 0) {
+        return errno;
+    }
+    place_ = {.device = status.st_dev, .inode = status.st_ino};
     if (const int error = enter(source_, copy_); error != 0) {
         return error;
     }
@@ -215,13 +219,13 @@ int TreeCopy::beginWith(const Folder& top) {
         return errno;
     }
     mask_ = MaskOfNewFiles(top.file());
-    return top.identify(&top_);
+    return 0;
 }
 
-/// A copy that lies inside its source would never end.
+/// A copy that lies inside its source would never end: it is met in the folder that it is made in.
 int TreeCopy::refuseItself(const struct stat& status) {
     const Folder::Identity identity{.device = status.st_dev, .inode = status.st_ino};
-    return !levels_.empty() && identity == top_ ? EINVAL : 0;
+    return identity == place_ ? EINVAL : 0;
 }
 
 /// The files and links of the folder that was entered last; its folders are noted.
@@ -345,6 +349,12 @@ int TreeCopy::copyLink(const ItemPlace& source, const ItemPlace& copy) {
     if (levels_.empty() &&
         fchownat(
             folder, copy.name.c_str(), static_cast<uid_t>(-1), getegid(), AT_SYMLINK_NOFOLLOW) !=
+            0) {
+        return errno;
+    }
+    // A link of root's is one that leads us: this one stays whose it was. Nobody sees it before.
+    if (status.st_uid != geteuid() &&
+        fchownat(folder, copy.name.c_str(), status.st_uid, status.st_gid, AT_SYMLINK_NOFOLLOW) !=
             0) {
         return errno;
     }

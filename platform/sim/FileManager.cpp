@@ -33,8 +33,10 @@ bool IsOrdinary(const FileNode& file) {
 FileNode CopyOf(const FileNode& file) {
     FileNode copy = file;
     copy.mode &= ~kSetIdBits;
-    copy.owner = ProcessUserId();
-    copy.group = ProcessGroupId();
+    if (!file.is(sim::kLink)) {
+        copy.owner = ProcessUserId();
+        copy.group = ProcessGroupId();
+    }
     std::erase_if(copy.attributes, [](const auto& attribute) {
         return !attribute.first.starts_with(kUserAttributes);
     });

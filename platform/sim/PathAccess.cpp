@@ -182,7 +182,8 @@ int PathAccess::setOwner(std::uint32_t uid, std::uint32_t gid) const {
     }
     Node* node = nullptr;
     const int error = state_->find(&node);
-    if (error == 0) {
+    const bool wouldVouch = error == 0 && node->file.is(sim::kLink) && uid == 0;
+    if (error == 0 && !wouldVouch) {
         const std::uint32_t oldGroup = node->file.groupId();
         node->file.owner = uid != kUnchanged ? uid : node->file.owner;
         node->file.group = gid != kUnchanged ? gid : oldGroup;

@@ -1,12 +1,22 @@
 #include "tests/support/HostileArchives.h"
 
+#include <sys/stat.h>
+
+#include <array>
 #include <cerrno>
+#include <cstdio>
+#include <filesystem>
+#include <fstream>
+#include <map>
+#include <stdexcept>
 #include <utility>
 
 #include "tests/support/ZipWriter.h"
 
 namespace zip {
 namespace {
+
+namespace fs = std::filesystem;
 
 using Lines = std::vector<std::string>;
 
@@ -289,6 +299,28 @@ void AddLargeOnes(std::vector<HostileArchive>& archives) {
     archives.push_back(Refused("2 GB of zeros that say they are 3", bomb, EILSEQ));
 }
 
+std::string ContentsOf(const std::string& path, mode_t mode) {
+    if (S_ISLNK(mode)) {
+        return fs::read_symlink(path);
+    }
+    std::ifstream file(S_ISREG(mode) ? path : "/dev/null", std::ios::binary);
+    return {std::istreambuf_iterator<char>(file), {}};
+}
+
+std::string LineOf(const std::string& path, const std::string& shown) {
+    struct stat status {};
+
+    if (lstat(path.c_str(), &status) != 0) {
+        throw std::runtime_error("cannot look at " + path);
+    }
+    constexpr const char* kTypes = "?pc?d?b?f?l?s???";
+    std::array<char, 8> mode{};
+    (void)std::snprintf(mode.data(), mode.size(), "%04o", status.st_mode & 07777U);
+    return kTypes[status.st_mode >> 12] + (" " + std::string(mode.data())) + " " + shown + " " +
+           ContentsOf(path, status.st_mode) +
+           (status.st_uid == 0 ? "" : " of " + std::to_string(status.st_uid));
+}
+
 }  // namespace
 
 std::vector<HostileArchive> HostileArchives() {
@@ -302,6 +334,19 @@ std::vector<HostileArchive> HostileArchives() {
     AddEnds(archives);
     AddLargeOnes(archives);
     return archives;
+}
+
+std::vector<std::string> Listing(const std::string& folder) {
+    std::map<std::string, std::string> lines;
+    for (const auto& entry : fs::recursive_directory_iterator(folder)) {
+        const std::string path = entry.path().string().substr(folder.size() + 1);
+        lines[path] = LineOf(entry.path(), path);
+    }
+    Lines listing;
+    for (auto& [path, line] : lines) {
+        listing.push_back(std::move(line));
+    }
+    return listing;
 }
 
 }  // namespace zip

@@ -16,4 +16,7 @@ struct HostileArchive {
 
 [[nodiscard]] std::vector<HostileArchive> HostileArchives();
 
+/// What lies below a folder, in such lines; whose it is, too, where that is not root.
+[[nodiscard]] std::vector<std::string> Listing(const std::string& folder);
+
 }  // namespace zip
