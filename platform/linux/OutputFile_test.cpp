@@ -4,8 +4,9 @@
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sys/mount.h>
+#include <sys/socket.h>
 #include <sys/stat.h>
-#include <sys/sysmacros.h>
+#include <sys/un.h>
 #include <unistd.h>
 
 #include <filesystem>
@@ -67,7 +68,12 @@ TEST_F(OutputFileOnLinux, RefusesWhatIsNoFileAndDoesNotWait) {
     EXPECT_EQ(open(kFolder + "/fifo"), EINVAL);
     EXPECT_EQ(open("/dev/full"), EINVAL);
     EXPECT_EQ(open("/dev/null"), EINVAL);
-    EXPECT_EQ(open("/run/systemd/journal/socket"), EINVAL);
+    sockaddr_un address{};
+    address.sun_family = AF_UNIX;
+    (void)(kFolder + "/socket").copy(address.sun_path, sizeof address.sun_path - 1);
+    const platform::OwnedFd socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+    ASSERT_EQ(bind(socket.get(), reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
+    EXPECT_EQ(open(kFolder + "/socket"), EINVAL);
 }
 
 TEST_F(OutputFileOnLinux, IsNotLedAwayByAStrangersLink) {
