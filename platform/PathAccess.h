@@ -1,10 +1,12 @@
 // A path that somebody else named, resolved once so that nobody can walk us elsewhere.
 #pragma once
 
+#include <cstddef>
 #include <cstdint>
 #include <memory>
 #include <string>
 #include <string_view>
+#include <vector>
 
 namespace platform {
 
@@ -19,8 +21,9 @@ struct FileStatus {
 /// The daemon is root and works below folders that the mobile user owns. On the way a symbolic link
 /// is followed if root owns it, or if it leads to something that the link's own owner owns;
 /// otherwise EPERM. ".." is taken as it stands. A resolution that failed is answered by every
-/// operation with its error. All operations return 0 or an errno value, and none but stat follows a
-/// link in the last step.
+/// operation with its error. All operations return 0 or an errno value, and
+/// only stat, realPath and read follow a link in the last step. A path that ends in a slash names
+/// what must be a directory: ENOTDIR for anything else.
 class PathAccess {
 public:
     explicit PathAccess(std::string_view path);
@@ -42,6 +45,25 @@ public:
     /// symlink(2): makes the path a link with these contents; EEXIST when something is there.
     [[nodiscard]] int symlink(std::string_view contents) const;
 
+    /// rmdir(2): an empty directory, and nothing else.
+    [[nodiscard]] int removeDirectory() const;
+
+    /// The contents of a link, whole; EINVAL when the item is none.
+    [[nodiscard]] int readLink(std::string* contents) const;
+
+    /// realpath(3) of what the path leads to, links followed by the rule.
+    [[nodiscard]] int realPath(std::string* path) const;
+
+    /// The bytes of the regular file that the path leads to. EINVAL for anything else, of which
+    /// none is opened; EFBIG when there are more than `most`. Never waits for another process.
+    [[nodiscard]] int read(std::size_t most, std::vector<std::byte>* contents) const;
+
+    /// lchown(2); what is all ones stays as it is.
+    [[nodiscard]] int setOwner(std::uint32_t uid, std::uint32_t gid) const;
+
+    /// chmod(2) of the item itself; a link has no mode of its own: EOPNOTSUPP.
+    [[nodiscard]] int setMode(std::uint32_t mode) const;
+
     /// mkdir(2): an empty directory with this mode less the process's mask.
     [[nodiscard]] int makeDirectory(std::uint32_t mode) const;
 
@@ -52,8 +74,14 @@ public:
     /// in one error line.
     [[nodiscard]] int synchronize() const;
 
-private:
+    /// What the twin keeps, for the file manager of the same twin.
     struct State;
+
+    explicit PathAccess(std::unique_ptr<State> state);
+
+    [[nodiscard]] const State& state() const { return *state_; }
+
+private:
     std::unique_ptr<State> state_;
 };
 

@@ -1,4 +1,4 @@
-// The user database: what the system knows of a user by name.
+// The user database: what the system knows of a user or a group by name.
 #pragma once
 
 #include <cstdint>
@@ -14,6 +14,9 @@ struct UserRecord {
 
 /// The record of a user, or none when there is no such user.
 [[nodiscard]] std::optional<UserRecord> UserRecordByName(const char* name);
+
+/// The number of a group, or none when there is no such group.
+[[nodiscard]] std::optional<std::uint32_t> GroupIdByName(const char* name);
 
 /// The home directory of a user in POSIX style, or none when the user or the home is missing.
 [[nodiscard]] std::optional<std::string> CopyHomeDirectoryForUser(const char* name);

@@ -19,10 +19,13 @@ using platform::OwnedFd;
 constexpr std::size_t kConnectionsMax = 64;
 constexpr std::size_t kDatagramMax = 256 * 1024;  // more than a socket's buffer takes
 
-bool Watch(int events, int descriptor) {
+/// The number of the listening socket among the connections.
+constexpr int kListening = 0;
+
+bool Watch(int events, int descriptor, int number) {
     epoll_event event{};
     event.events = EPOLLIN;
-    event.data.fd = descriptor;
+    event.data.fd = number;
     return epoll_ctl(events, EPOLL_CTL_ADD, descriptor, &event) == 0;
 }
 
@@ -31,7 +34,8 @@ bool Watch(int events, int descriptor) {
 std::optional<NamedPort> NamedPort::own(std::string_view name) {
     OwnedFd listening = platform::BindServiceSocket(name);
     OwnedFd events(epoll_create1(EPOLL_CLOEXEC));
-    if (!listening.isOpen() || !events.isOpen() || !Watch(events.get(), listening.get())) {
+    if (!listening.isOpen() || !events.isOpen() ||
+        !Watch(events.get(), listening.get(), kListening)) {
         return std::nullopt;
     }
     return NamedPort(std::move(listening), std::move(events));
@@ -51,7 +55,7 @@ std::optional<PortMessage> NamedPort::receive(int timeoutMs) {
         if (epoll_wait(events_.get(), &event, 1, wait) != 1) {
             return std::nullopt;
         }
-        if (event.data.fd == listening_.get()) {
+        if (event.data.fd == kListening) {
             accept();
         } else if (auto message = read(event.data.fd)) {
             return message;
@@ -61,19 +65,23 @@ std::optional<PortMessage> NamedPort::receive(int timeoutMs) {
 
 void NamedPort::accept() {
     OwnedFd connection(accept4(listening_.get(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK));
-    if (!connection.isOpen() || !Watch(events_.get(), connection.get())) {
+    if (!connection.isOpen() || !Watch(events_.get(), connection.get(), lastNumber_ + 1)) {
         return;
     }
     if (connections_.size() == kConnectionsMax) {
         connections_.erase(connections_.begin());
     }
-    const int number = connection.get();
-    connections_.emplace(number, std::move(connection));
+    connections_.emplace(++lastNumber_, std::move(connection));
 }
 
 std::optional<PortMessage> NamedPort::read(int sender) {
+    const auto connection = connections_.find(sender);
+    if (connection == connections_.end()) {
+        return std::nullopt;
+    }
     std::vector<std::byte> datagram(kDatagramMax);
-    const ssize_t size = recv(sender, datagram.data(), datagram.size(), MSG_TRUNC);
+    const ssize_t size =
+        recv(connection->second.get(), datagram.data(), datagram.size(), MSG_TRUNC);
     if (size < 0 && (errno == EAGAIN || errno == EINTR)) {
         return std::nullopt;
     }
@@ -83,7 +91,7 @@ std::optional<PortMessage> NamedPort::read(int sender) {
         header = platform::Load<MachMsgHeader>(datagram, 0);
     }
     if (length < sizeof header || header.size != length) {
-        connections_.erase(sender);
+        connections_.erase(connection);
         return std::nullopt;
     }
     datagram.resize(length);
@@ -96,8 +104,9 @@ bool NamedPort::send(int sender, std::int32_t id, std::span<const std::byte> bod
     const MachMsgHeader header{.size = static_cast<std::uint32_t>(datagram.size()), .id = id};
     platform::Store(std::span(datagram), 0, header);
     std::ranges::copy(body, datagram.begin() + sizeof header);
-    return connections_.contains(sender) &&
-           ::send(sender, datagram.data(), datagram.size(), MSG_NOSIGNAL) ==
+    const auto connection = connections_.find(sender);
+    return connection != connections_.end() &&
+           ::send(connection->second.get(), datagram.data(), datagram.size(), MSG_NOSIGNAL) ==
                static_cast<ssize_t>(datagram.size());
 }
 

@@ -15,7 +15,7 @@ namespace tools {
 
 /// What arrived: one datagram, without its header.
 struct PortMessage {
-    int sender = -1;      ///< names the connection for a reply; valid until the next receive
+    int sender = -1;      ///< names the connection for a reply, and never another one
     std::int32_t id = 0;  ///< of the message
     std::vector<std::byte> body{};
 };
@@ -47,7 +47,8 @@ private:
 
     platform::OwnedFd listening_;
     platform::OwnedFd events_;
-    std::map<int, platform::OwnedFd> connections_;
+    std::map<int, platform::OwnedFd> connections_;  // by number, the oldest first
+    int lastNumber_ = 0;
 };
 
 }  // namespace tools

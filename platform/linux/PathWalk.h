@@ -47,6 +47,10 @@ struct SplitPath {
 /// Opens the folder that a path's last step lies in; an empty path is ENOENT.
 [[nodiscard]] Opened OpenParent(std::string_view path);
 
+/// Opens a folder below another (O_PATH), following no link: ENOTDIR for one on the way. An empty
+/// path is the folder itself.
+[[nodiscard]] Opened OpenBelow(int folder, std::string_view path);
+
 /// Opens one name with O_PATH, not following a link there.
 [[nodiscard]] Opened OpenPath(int directory, const char* name);
 

@@ -63,6 +63,14 @@ void ProcessSettleIn() {
     (void)mallopt(M_MMAP_THRESHOLD, 128 << 10);
 }
 
+std::uint32_t ProcessUserId() {
+    return getuid();
+}
+
+std::uint32_t ProcessGroupId() {
+    return getgid();
+}
+
 void ProcessOnTerminationRequest(std::function<void()> handler) {
     const sigset_t signals = TerminationSignals();
     OwnedFd descriptor(signalfd(-1, &signals, SFD_CLOEXEC | SFD_NONBLOCK));

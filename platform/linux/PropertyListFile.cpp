@@ -4,13 +4,14 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <cerrno>
 #include <cstring>
 
 #include "platform/Assertion.h"
 #include "platform/PropertyListXml.h"
 #include "platform/linux/OwnedFd.h"
+#include "platform/linux/ReplacementFile.h"
+#include "platform/linux/WholeFile.h"
 
 namespace platform {
 namespace {
@@ -38,130 +39,6 @@ Contents NotOpened(int error, PropertyListFile::Links links) {
     return Unusable(State::kUnreadable,
                     isLink ? kNotRegular : "cannot be read: " + ErrorText(error));
 }
-
-/// The bytes of a file of at most the largest size, or an errno value. Files can grow while they
-/// are read.
-int ReadWhole(const OwnedFd& file, std::size_t size, std::vector<std::byte>& bytes) {
-    constexpr std::size_t kMost = kPropertyListLimits.bytes;
-    bytes.resize(size + 1);
-    std::size_t length = 0;
-    for (;;) {
-        if (length > kMost) {
-            return EFBIG;
-        }
-        if (length == bytes.size()) {
-            bytes.resize(std::min(length * 2, kMost + 1));
-        }
-        const ssize_t count = ::read(file.get(), bytes.data() + length, bytes.size() - length);
-        if (count < 0 && errno != EINTR) {
-            return errno;
-        }
-        if (count == 0) {
-            bytes.resize(length);
-            return 0;
-        }
-        length += count > 0 ? static_cast<std::size_t>(count) : 0;
-    }
-}
-
-/// Gathers the pieces of the text and writes them to a file.
-class Output {
-public:
-    explicit Output(const OwnedFd& file) : file_(file) { buffer_.reserve(kBufferSize); }
-
-    void put(std::string_view text) {
-        if (buffer_.size() + text.size() > kBufferSize) {
-            flush();
-        }
-        if (text.size() > kBufferSize) {
-            write(text);
-        } else {
-            buffer_ += text;
-        }
-    }
-
-    /// 0 when everything reached the disk.
-    [[nodiscard]] int finish() {
-        flush();
-        return error_ == 0 && fsync(file_.get()) != 0 ? errno : error_;
-    }
-
-private:
-    static constexpr std::size_t kBufferSize = 64U << 10;
-
-    void flush() {
-        write(buffer_);
-        buffer_.clear();
-    }
-
-    void write(std::string_view text) {
-        while (error_ == 0 && !text.empty()) {
-            const ssize_t count = ::write(file_.get(), text.data(), text.size());
-            if (count < 0 && errno != EINTR) {
-                error_ = errno;
-            }
-            text.remove_prefix(count > 0 ? static_cast<std::size_t>(count) : 0);
-        }
-    }
-
-    const OwnedFd& file_;
-    std::string buffer_;
-    int error_ = 0;
-};
-
-/// A folder is opened for reading to be synced; where that is not allowed, what was done in it is
-/// as sure as the file system makes it.
-int SyncFolder(int folder) {
-    const OwnedFd readable(openat(folder, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-    return readable.isOpen() && fsync(readable.get()) != 0 ? errno : 0;
-}
-
-/// A complete new file beside the old one; goes with the object unless it took the old one's place.
-class Replacement {
-public:
-    explicit Replacement(int folder) : folder_(folder) {}
-
-    ~Replacement() {
-        if (isMade_) {
-            unlinkat(folder_, kTemporaryName, 0);
-        }
-    }
-
-    Replacement(const Replacement&) = delete;
-    Replacement& operator=(const Replacement&) = delete;
-
-    /// Nobody can have us write through what they put there: it is removed, and made anew by us.
-    [[nodiscard]] int make(const PropertyList& entries, mode_t mode) {
-        // What stays in the way all the same fails the creation.
-        (void)unlinkat(folder_, kTemporaryName, 0);
-        const OwnedFd file(openat(folder_,
-                                  kTemporaryName,
-                                  O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC,
-                                  S_IRUSR | S_IWUSR));
-        if (!file.isOpen()) {
-            return errno;
-        }
-        isMade_ = true;
-        if (fchmod(file.get(), mode) != 0) {
-            return errno;
-        }
-        Output output(file);
-        WriteXmlPropertyList(entries, [&output](std::string_view text) { output.put(text); });
-        return output.finish();
-    }
-
-    [[nodiscard]] int takePlaceOf(const std::string& name) {
-        if (renameat(folder_, kTemporaryName, folder_, name.c_str()) != 0) {
-            return errno;
-        }
-        isMade_ = false;
-        return SyncFolder(folder_);
-    }
-
-private:
-    const int folder_;
-    bool isMade_ = false;
-};
 
 std::string KeptName(const std::string& name) {
     return name + ".damaged";
@@ -201,7 +78,10 @@ Contents PropertyListFile::read(Links links) const {
     std::vector<std::byte> bytes;
     const bool isTooLarge = status.st_size > static_cast<off_t>(kPropertyListLimits.bytes);
     const int error =
-        isTooLarge ? EFBIG : ReadWhole(file, static_cast<std::size_t>(status.st_size), bytes);
+        isTooLarge
+            ? EFBIG
+            : ReadWhole(
+                  file, static_cast<std::size_t>(status.st_size), kPropertyListLimits.bytes, bytes);
     if (error != 0) {
         return Unusable(State::kUnreadable, "cannot be read: " + ErrorText(error));
     }
@@ -218,13 +98,15 @@ std::string PropertyListFile::replace(const Contents& contents, mode_t mode) con
         return "cannot be written: it would hold more than 16 MiB or 200,000 objects, or "
                "characters that XML cannot hold";
     }
-    Replacement replacement(folder_);
-    int error = replacement.make(contents.entries, mode);
+    ReplacementFile replacement(folder_, kTemporaryName);
+    int error = replacement.make(mode, [&contents](const ReplacementFile::Put& put) {
+        WriteXmlPropertyList(contents.entries, put);
+    });
     if (error == 0 && contents.state == State::kDamaged) {
         error = KeepDamaged(folder_, name_);
     }
     if (error == 0) {
-        error = replacement.takePlaceOf(name_);
+        error = replacement.takePlace(name_);
     }
     return error == 0 ? std::string() : "cannot be written: " + ErrorText(error);
 }

@@ -36,6 +36,21 @@ std::unique_ptr<Node>& Root() {
     return root;
 }
 
+int ResolveFrom(Node* start, std::string_view path, Links links, Place* place) {
+    while (path.size() > 1 && path.ends_with('/')) {
+        path.remove_suffix(1);
+        place->mustBeDirectory = true;
+    }
+    const std::size_t slash = path.rfind('/');
+    const std::size_t folder = slash == std::string_view::npos ? 0 : slash + 1;
+    place->name = path.substr(folder);
+    if (place->name.size() > kNameMax) {
+        return ENAMETOOLONG;
+    }
+    const int error = Walk(links).walk(start, path.substr(0, folder), &place->parent);
+    return error == 0 && !place->parent->file.is(sim::kDirectory) ? ENOTDIR : error;
+}
+
 Place PlaceInWorld(std::string_view path) {
     Place place;
     if (Resolve(path, Links::kAll, &place) != 0) {
@@ -49,6 +64,10 @@ Place PlaceInWorld(std::string_view path) {
 Node* Node::add(std::string_view name, FileNode made) {
     auto node = std::make_unique<Node>();
     node->file = std::move(made);
+    return add(name, std::move(node));
+}
+
+Node* Node::add(std::string_view name, std::unique_ptr<Node> node) {
     node->parent = this;
     auto& place = children[std::string(name)];
     place = std::move(node);
@@ -58,6 +77,22 @@ Node* Node::add(std::string_view name, FileNode made) {
 Node* Node::child(std::string_view name) const {
     const auto found = children.find(name);
     return found == children.end() ? nullptr : found->second.get();
+}
+
+const Node* FileSystemOf(const Node& node) {
+    const Node* at = &node;
+    while (!at->isMountPoint && at != TreeRoot()) {
+        at = at->parent;
+    }
+    return at;
+}
+
+bool IsWithin(const Node& node, const Node& folder) {
+    const Node* at = &node;
+    while (at != &folder && at != TreeRoot()) {
+        at = at->parent;
+    }
+    return at == &folder;
 }
 
 Node* TreeRoot() {
@@ -99,6 +134,9 @@ int Walk::step(Node** at, std::string_view name) {
 }
 
 int Walk::follow(const Node& link, Node** at) {
+    if (links_ == Links::kNone) {
+        return ENOTDIR;
+    }
     if (++followed_ > kLinksMax) {
         return ELOOP;
     }
@@ -119,21 +157,11 @@ int Resolve(std::string_view path, Links links, Place* place) {
     if (path.empty()) {
         return ENOENT;
     }
-    if (path.size() >= kPathMax) {
-        return ENAMETOOLONG;
-    }
-    while (path.size() > 1 && path.ends_with('/')) {
-        path.remove_suffix(1);
-        place->mustBeDirectory = true;
-    }
-    const std::size_t slash = path.rfind('/');
-    const std::size_t folder = slash == std::string_view::npos ? 0 : slash + 1;
-    place->name = path.substr(folder);
-    if (place->name.size() > kNameMax) {
-        return ENAMETOOLONG;
-    }
-    const int error = Walk(links).walk(Root().get(), path.substr(0, folder), &place->parent);
-    return error == 0 && !place->parent->file.is(sim::kDirectory) ? ENOTDIR : error;
+    return path.size() >= kPathMax ? ENAMETOOLONG : ResolveFrom(TreeRoot(), path, links, place);
+}
+
+int ResolveBelow(Node* folder, std::string_view subpath, Place* place) {
+    return ResolveFrom(folder, subpath, Links::kNone, place);
 }
 
 /// What stands at a place, or null.
@@ -164,6 +192,21 @@ void MakeLink(std::string_view path, std::string_view target, std::uint32_t owne
 void RemoveFile(std::string_view path) {
     const Place place = PlaceInWorld(path);
     place.parent->children.erase(place.name);
+}
+
+void LinkFile(std::string_view path, std::string_view secondPath) {
+    const Place second = PlaceInWorld(secondPath);
+    second.parent->add(second.name, std::make_unique<Node>(NodeAt(PlaceInWorld(path))->inode));
+}
+
+bool AreOneFile(std::string_view path, std::string_view otherPath) {
+    const Node* const node = NodeAt(PlaceInWorld(path));
+    const Node* const other = NodeAt(PlaceInWorld(otherPath));
+    return node != nullptr && other != nullptr && node->inode == other->inode;
+}
+
+void MountAt(std::string_view path) {
+    NodeAt(PlaceInWorld(path))->isMountPoint = true;
 }
 
 std::optional<FileNode> FileAt(std::string_view path) {

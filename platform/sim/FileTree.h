@@ -5,26 +5,40 @@
 #include <memory>
 #include <string>
 #include <string_view>
+#include <utility>
 
 #include "platform/sim/SimFiles.h"
 
 namespace sim {
 
 struct Node {
-    FileNode file;
+    Node() : Node(std::make_shared<FileNode>()) {}
+
+    explicit Node(std::shared_ptr<FileNode> shared) : inode(std::move(shared)), file(*inode) {}
+
+    std::shared_ptr<FileNode> inode;  ///< hard links share it
+    FileNode& file;
     Node* parent = nullptr;
+    bool isMountPoint = false;
     std::map<std::string, std::unique_ptr<Node>, std::less<>> children;
 
     /// Puts something into a directory, in place of what has the name.
     Node* add(std::string_view name, FileNode made);
+    Node* add(std::string_view name, std::unique_ptr<Node> node);
 
     [[nodiscard]] Node* child(std::string_view name) const;
 };
 
+/// The folder that begins the file system on which something lies.
+[[nodiscard]] const Node* FileSystemOf(const Node& node);
+
+/// Whether `node` is `folder` or lies somewhere below it.
+[[nodiscard]] bool IsWithin(const Node& node, const Node& folder);
+
 /// The top of the tree.
 [[nodiscard]] Node* TreeRoot();
 
-enum class Links : bool { kByRule, kAll };
+enum class Links : std::uint8_t { kByRule, kAll, kNone };
 
 /// One resolution: the links that it has followed are counted from end to end.
 class Walk {
@@ -51,6 +65,9 @@ struct Place {
 
 /// 0 or an errno value.
 int Resolve(std::string_view path, Links links, Place* place);
+
+/// The same for a path below a folder; no link on the way there is followed.
+int ResolveBelow(Node* folder, std::string_view subpath, Place* place);
 
 /// What stands at a place, or null.
 [[nodiscard]] Node* NodeAt(const Place& place);

@@ -1,22 +1,25 @@
 // The file tree in memory, with the rules of the road for links that strangers own.
 #include "platform/PathAccess.h"
 
+#include <algorithm>
 #include <cerrno>
+#include <span>
 #include <utility>
 
-#include "platform/sim/FileTree.h"
+#include "platform/sim/PathState.h"
 #include "platform/sim/World.h"
 
 using sim::Links;
 using sim::Node;
 using sim::Place;
-using sim::Walk;
 
 namespace platform {
 namespace {
 
+constexpr std::uint32_t kUnchanged = 0xFFFFFFFF;
+
 FileStatus StatusOf(const Node& node) {
-    return {.mode = node.file.mode, .uid = node.file.owner, .gid = node.file.owner};
+    return {.mode = node.file.mode, .uid = node.file.owner, .gid = node.file.groupId()};
 }
 
 bool NamesAnEntry(const Place& place) {
@@ -43,44 +46,14 @@ int ReplacementError(const Node& node, const Place& place) {
 
 }  // namespace
 
-struct PathAccess::State {
-    std::string path;
-    Place place;
-    int error = 0;
-
-    int find(const Node** found) const {
-        if (error != 0) {
-            return error;
-        }
-        *found = NodeAt(place);
-        if (*found == nullptr) {
-            return ENOENT;
-        }
-        return place.mustBeDirectory && !(*found)->file.is(sim::kDirectory) ? ENOTDIR : 0;
-    }
-
-    /// The same, where a link means what it leads to.
-    int findBehindLink(const Node** found) const {
-        const Node* const node = error == 0 ? NodeAt(place) : nullptr;
-        if (node == nullptr || !node->file.is(sim::kLink)) {
-            return find(found);
-        }
-        Node* end = nullptr;
-        if (const int failure = Walk(Links::kByRule).walk(place.parent, place.name, &end);
-            failure != 0) {
-            return failure;
-        }
-        *found = end;
-        return place.mustBeDirectory && !end->file.is(sim::kDirectory) ? ENOTDIR : 0;
-    }
-};
-
 PathAccess::PathAccess(std::string_view path) : state_(std::make_unique<State>()) {
     state_->path = path;
     state_->error = sim::CallFails("PathAccess.open", path)
                         ? EMFILE
                         : Resolve(path, Links::kByRule, &state_->place);
 }
+
+PathAccess::PathAccess(std::unique_ptr<State> state) : state_(std::move(state)) {}
 
 PathAccess::PathAccess(PathAccess&&) noexcept = default;
 PathAccess& PathAccess::operator=(PathAccess&&) noexcept = default;
@@ -120,15 +93,7 @@ int PathAccess::remove() const {
     if (const int error = state_->find(&node); error != 0) {
         return error;
     }
-    const auto& [parent, name, mustBeDirectory] = state_->place;
-    if (name.empty() || name == ".") {
-        return EINVAL;
-    }
-    if (name == ".." || !node->children.empty()) {
-        return ENOTEMPTY;
-    }
-    parent->children.erase(name);
-    return 0;
+    return state_->removeEntry(*node);
 }
 
 int PathAccess::symlink(std::string_view contents) const {
@@ -147,6 +112,94 @@ int PathAccess::symlink(std::string_view contents) const {
     state_->place.parent->add(
         state_->place.name,
         {.mode = sim::kLink | 0777, .owner = 0, .contents = std::string(contents)});
+    return 0;
+}
+
+int PathAccess::removeDirectory() const {
+    if (sim::CallFails("PathAccess.removeDirectory", state_->path)) {
+        return EIO;
+    }
+    const Node* node = nullptr;
+    if (const int error = state_->find(&node); error != 0) {
+        return error;
+    }
+    return node->file.is(sim::kDirectory) ? state_->removeEntry(*node) : ENOTDIR;
+}
+
+int PathAccess::readLink(std::string* contents) const {
+    if (sim::CallFails("PathAccess.readLink", state_->path)) {
+        return EIO;
+    }
+    const Node* node = nullptr;
+    if (const int error = state_->find(&node); error != 0) {
+        return error;
+    }
+    if (!node->file.is(sim::kLink)) {
+        return EINVAL;
+    }
+    *contents = node->file.contents;
+    return 0;
+}
+
+int PathAccess::realPath(std::string* path) const {
+    if (sim::CallFails("PathAccess.realPath", state_->path)) {
+        return EIO;
+    }
+    const Node* node = nullptr;
+    if (const int error = state_->findBehindLink(&node); error != 0) {
+        return error;
+    }
+    std::string text;
+    for (; node != sim::TreeRoot(); node = node->parent) {
+        const auto& siblings = node->parent->children;
+        const auto self = std::ranges::find_if(
+            siblings, [node](const auto& sibling) { return sibling.second.get() == node; });
+        text.insert(0, "/" + self->first);
+    }
+    *path = text.empty() ? "/" : text;
+    return 0;
+}
+
+int PathAccess::read(std::size_t most, std::vector<std::byte>* contents) const {
+    if (sim::CallFails("PathAccess.read", state_->path)) {
+        return EIO;
+    }
+    const Node* node = nullptr;
+    if (const int error = state_->findBehindLink(&node); error != 0) {
+        return error;
+    }
+    if (!node->file.is(sim::kRegular) || node->file.contents.size() > most) {
+        return node->file.is(sim::kRegular) ? EFBIG : EINVAL;
+    }
+    const auto bytes = std::as_bytes(std::span(node->file.contents));
+    contents->assign(bytes.begin(), bytes.end());
+    return 0;
+}
+
+int PathAccess::setOwner(std::uint32_t uid, std::uint32_t gid) const {
+    if (sim::CallFails("PathAccess.setOwner", state_->path)) {
+        return EPERM;
+    }
+    Node* node = nullptr;
+    const int error = state_->find(&node);
+    if (error == 0) {
+        const std::uint32_t oldGroup = node->file.groupId();
+        node->file.owner = uid != kUnchanged ? uid : node->file.owner;
+        node->file.group = gid != kUnchanged ? gid : oldGroup;
+    }
+    return error;
+}
+
+int PathAccess::setMode(std::uint32_t mode) const {
+    if (sim::CallFails("PathAccess.setMode", state_->path)) {
+        return EPERM;
+    }
+    Node* node = nullptr;
+    const int error = state_->find(&node);
+    if (error != 0 || node->file.is(sim::kLink)) {
+        return error != 0 ? error : EOPNOTSUPP;
+    }
+    node->file.mode = (node->file.mode & 0170000) | (mode & 07777);
     return 0;
 }
 

@@ -51,6 +51,9 @@ public:
 
     /// The first timer due, the first posted task, and whatever the sources have.
     [[nodiscard]] std::size_t readyCount() const override {
+        if (stopRequested_) {
+            return 0;  // queues may go on for a while before the run gets to end
+        }
         std::size_t count = tasks_.readyCount() + (isTimerReady() ? 1 : 0);
         for (const auto& source : sources_) {
             count += source->readyCount();
@@ -59,6 +62,9 @@ public:
     }
 
     [[nodiscard]] double nextDue() const override {
+        if (stopRequested_) {
+            return kNever;
+        }
         const auto timer = firstTimer();
         return std::min(tasks_.nextDue(), timer == nullptr ? kNever : timer->fireDate());
     }

@@ -91,6 +91,14 @@ void ProcessSettleIn() {
     sim::NoteCall("ProcessSettleIn");
 }
 
+std::uint32_t ProcessUserId() {
+    return 0;
+}
+
+std::uint32_t ProcessGroupId() {
+    return 0;
+}
+
 void ProcessOnTerminationRequest(std::function<void()> handler) {
     sim::NoteCall("ProcessOnTerminationRequest");
     sim::TheServices().terminationHandler = std::move(handler);

@@ -28,6 +28,7 @@ struct PreferenceDomains {
 struct Services {
     std::map<std::string, User, std::less<>> users{
         {"mobile", {.record = {.uid = 501, .gid = 501}, .home = "/var/mobile"}}};
+    std::map<std::string, std::uint32_t, std::less<>> groups{{"mobile", 501}, {"wheel", 0}};
     std::vector<PreferencesFlush> flushes;
     PreferenceDomains preferences{};
     Baseband baseband = Baseband::kAbsent;

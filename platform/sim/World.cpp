@@ -181,6 +181,7 @@ void Reset(std::uint64_t seed) {
     ResetPorts();
     ResetProcesses();
     ResetEcho();
+    ResetArchives();
     ResetFiles();
     ResetLibraries();
     ResetMailbox();

@@ -115,6 +115,7 @@ void ResetMainLoop();
 void ResetQueues();
 void ResetPorts();
 void ResetEcho();
+void ResetArchives();
 void ResetFiles();
 void ResetLibraries();
 void ResetMailbox();

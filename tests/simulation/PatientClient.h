@@ -35,7 +35,8 @@ public:
 
 private:
     static constexpr double kPollInterval = 0.001;
-    static constexpr int kPollsMax = 1000;
+    static constexpr int kPollsInHaste = 1000;  ///< from then on it looks once a second
+    static constexpr int kPollsMax = 1100;
 
     void connect() {
         ++connections_;
@@ -56,7 +57,7 @@ private:
         } else if (client.service.isHungUp()) {
             connect();
         } else if (++polls_ < kPollsMax) {
-            sim::In(kPollInterval, [this] { poll(); });
+            sim::In(polls_ < kPollsInHaste ? kPollInterval : 1.0, [this] { poll(); });
         } else {
             ADD_FAILURE() << "client " << client.identity.pid << " waits for ever at "
                           << sim::Now();

@@ -44,6 +44,13 @@ bool Contains(const std::string& text, const std::string& part) {
     return text.find(part) != std::string::npos;
 }
 
+/// The reply of a routine with a number in it.
+Bytes NumberReply(std::int32_t id, std::int32_t number) {
+    Bytes reply = SimpleReply(id, 0, 40);
+    Put<std::int32_t>(reply, 36, number);
+    return reply;
+}
+
 class LfhelperTest : public testing::Test {
 protected:
     /// Answers one request of one client.
@@ -138,6 +145,63 @@ TEST_F(LfhelperTest, CreatesASymbolicLink) {
               "\"meaning\":\"the operation failed, or an argument is not UTF-8 or no property "
               "list\","
               "\"target\":\"target\",\"link\":\"link\"}\n");
+}
+
+TEST_F(LfhelperTest, CopiesAFile) {
+    const auto outcome = runAnswered("copy-file from to name", NumberReply(8683564, 1));
+    EXPECT_EQ(outcome.exitStatus, 0);
+    EXPECT_EQ(outcome.output, "copy-file: success\n");
+    EXPECT_EQ(requestText(32) + " " + requestText(288) + " " + requestText(544), "from to name");
+}
+
+TEST_F(LfhelperTest, SaysWhenTheServiceDidNotDoIt) {
+    const auto outcome = runAnswered("move-directory source to name", NumberReply(8683566, 0));
+    EXPECT_EQ(outcome.exitStatus, 1);
+    EXPECT_EQ(outcome.output,
+              "lfhelper: move-directory: the service did not move source to to as name; its log "
+              "tells why\n");
+}
+
+TEST_F(LfhelperTest, TellsProgramsThatItWasNotDone) {
+    const auto outcome =
+        runAnswered("--json copy-archive source destination", NumberReply(8683571, 0));
+    EXPECT_EQ(outcome.exitStatus, 1);
+    EXPECT_EQ(outcome.output,
+              "{\"command\":\"copy-archive\",\"exitStatus\":1,\"code\":null,\"name\":\"NOT_DONE\","
+              "\"meaning\":\"the service did not copy all of source to destination; its log "
+              "tells why\",\"done\":false,\"source\":\"source\",\"destination\":"
+              "\"destination\"}\n");
+    EXPECT_EQ(requestText(32) + " " + requestText(288), "source destination");
+}
+
+TEST_F(LfhelperTest, TellsProgramsThatItWasDone) {
+    const auto outcome = runAnswered("--json copy-log-directory source", NumberReply(8683565, 1));
+    EXPECT_EQ(outcome.exitStatus, 0);
+    EXPECT_TRUE(Contains(outcome.output, "\"done\":true,\"source\":\"source\"}"));
+    EXPECT_EQ(requestText(32), "source");
+}
+
+TEST_F(LfhelperTest, ShowsAPropertyListFile) {
+    const std::string list = List("<dict/>");
+    const auto outcome = runAnswered(
+        "load-plist path",
+        BulkReply(
+            8683572, static_cast<std::uint32_t>(list.size()), Bytes(list.begin(), list.end())));
+    EXPECT_EQ(outcome.exitStatus, 0);
+    EXPECT_EQ(outcome.output, list);
+    EXPECT_EQ(requestText(32), "path");
+}
+
+TEST_F(LfhelperTest, SaysThatAPropertyListFileHoldsNoDictionary) {
+    const auto outcome = runAnswered("load-plist path", SimpleReply(8683572, 9));
+    EXPECT_EQ(outcome.exitStatus, 1);
+    EXPECT_EQ(outcome.output.rfind("lfhelper: load-plist: 9 NO_DATA: ", 0), 0U);
+}
+
+TEST_F(LfhelperTest, DoesNotTakeAnAbsentValueForADictionary) {
+    const auto outcome = runAnswered("load-plist path", BulkReply(8683572, 0));
+    EXPECT_EQ(outcome.exitStatus, 1);
+    EXPECT_TRUE(Contains(outcome.output, "ERROR_INVALID_REPLY"));
 }
 
 TEST_F(LfhelperTest, RemovesAPreferenceDomain) {
@@ -322,6 +386,28 @@ TEST_F(LfhelperTest, ShowsWhatStandsBehindTheFieldsOfARawReply) {
     EXPECT_EQ(Get<std::int32_t>(request, 20), 8683568);
     EXPECT_TRUE(Contains(outcome.output, "  0024  44 45 00 ")) << outcome.output;
     EXPECT_TRUE(Contains(outcome.output, "|DE..............|\n"));
+}
+
+TEST_F(LfhelperTest, SwitchesTheHeartbeat) {
+    for (const bool isOn : {true, false}) {
+        Service another;
+        another.play([this](Service& self) {
+            const Session session = self.checkIn();
+            request = Receive(session.port.get()).bytes;
+            Send(session.port.get(), SimpleReply(8683562, 0));
+        });
+        const auto outcome = RunProgram(another, isOn ? "heartbeat on" : "heartbeat off");
+        EXPECT_EQ(outcome.exitStatus, 0) << outcome.output;
+        ASSERT_EQ(request.size(), 36U);
+        EXPECT_EQ(request[32], isOn ? 1 : 0);
+    }
+}
+
+TEST_F(LfhelperTest, TellsProgramsOfTheHeartbeat) {
+    const auto outcome = runAnswered("--json heartbeat on", SimpleReply(8683562, 5));
+    EXPECT_EQ(outcome.exitStatus, 1);
+    EXPECT_TRUE(Contains(outcome.output, "\"state\":\"on\"")) << outcome.output;
+    EXPECT_TRUE(Contains(outcome.output, "\"code\":5"));
 }
 
 TEST_F(LfhelperTest, ShowsARawBulkReply) {
