@@ -21,7 +21,6 @@ constexpr std::array<CodeText, 22> kCodeTexts{{
     {LF_MOBILE_HELPER_NO_ACCESS,               "NO_ACCESS",               "the path is not one that the service may change"},
     {LF_MOBILE_HELPER_NO_DATA,                 "NO_DATA",                 "the property-list file is missing or holds no dictionary"},
     {LF_MOBILE_HELPER_NOT_ENTITLED,            "NOT_ENTITLED",            "the group of the caller is not entitled to use the service"},
-    {LF_MOBILE_HELPER_NOT_SUPPORTED,           "NOT_SUPPORTED",           "the service was built without this operation"},
     {LF_MOBILE_HELPER_TYPE_ERROR,              "TYPE_ERROR",              "a descriptor has the wrong type, or two sizes in the message disagree"},
     {LF_MOBILE_HELPER_BAD_ID,                  "BAD_ID",                  "no routine has this message id"},
     {LF_MOBILE_HELPER_BAD_ARGUMENTS,           "BAD_ARGUMENTS",           "the message has the wrong size or form, or what must come beside it is missing or unusable"},

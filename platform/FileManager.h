@@ -16,7 +16,9 @@ namespace platform {
 // All of these return 0 or an errno value; there is no failure without one. Paths are resolved by
 // the rule of PathAccess, the last step is taken as it is (a link there is the item), and inside a
 // tree nothing but descriptors is followed: whoever exchanges folders and links meanwhile leads
-// nobody elsewhere. The call returns when the work is done, and never waits for another process.
+// nobody elsewhere. The call returns when the work is done, and never waits for another process. A
+// tree that was made to be endless is E2BIG: when the names still to be visited, or the hard links
+// found, would take more than 64 MiB.
 
 /// Asked about what cannot be copied inside a tree, by its path below the top. True: leave it out
 /// and go on. What no item can be blamed for, such as a full disk, is not asked about.

@@ -23,7 +23,6 @@ inline constexpr kern_return_t KERN_NO_ACCESS = 8;
 inline constexpr kern_return_t KERN_INVALID_NAME = 15;
 inline constexpr kern_return_t KERN_INVALID_RIGHT = 17;
 inline constexpr kern_return_t KERN_INVALID_SECURITY = 35;
-inline constexpr kern_return_t KERN_NOT_SUPPORTED = 46;
 
 enum class MachPortRight : std::uint8_t { kSend, kReceive };
 

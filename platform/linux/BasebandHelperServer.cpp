@@ -3,8 +3,8 @@
 #include <string>
 
 #include "platform/BuildConstants.h"
-#include "platform/linux/BasebandHelperModule.h"
 #include "platform/DynamicLibrary.h"
+#include "platform/linux/BasebandHelperModule.h"
 
 namespace platform {
 namespace {

@@ -39,6 +39,36 @@ Opened OpenWithoutLinks(int from, std::string_view path, std::uint64_t resolve) 
     return {.file = std::move(file), .error = error};
 }
 
+/// As much of the path at once as the system takes.
+Opened OpenInPieces(int folder, std::string_view path) {
+    constexpr std::size_t kPieceMax = PATH_MAX - 1;
+    Opened end = {.file = {}, .error = 0};
+    do {
+        auto length = path.size();
+        if (length > kPieceMax) {
+            const auto slash = path.rfind('/', kPieceMax);
+            length = slash == std::string_view::npos ? kPieceMax : slash + 1;
+        }
+        const int from = end.file.isOpen() ? end.file.get() : folder;
+        end = OpenWithoutLinks(from, path.substr(0, length), RESOLVE_BENEATH);
+        path.remove_prefix(length);
+    } while (end.error == 0 && !path.empty());
+    return end;
+}
+
+/// The same where the system does not know the call.
+Opened OpenStepByStep(int folder, std::string_view path) {
+    Opened end = OpenFolder(folder, ".");
+    while (end.error == 0 && !path.empty()) {
+        const std::string name(path.substr(0, path.find('/')));
+        path.remove_prefix(std::min(name.size() + 1, path.size()));
+        if (!name.empty()) {
+            end = OpenFolder(end.file.get(), name.c_str());
+        }
+    }
+    return end;
+}
+
 }  // namespace
 
 Opened PathWalk::follow(std::string_view path, int from) {
@@ -120,20 +150,12 @@ Opened OpenParent(std::string_view path) {
 }
 
 Opened OpenBelow(int folder, std::string_view path) {
-    Opened end = OpenWithoutLinks(folder, path, RESOLVE_BENEATH);
-    if (end.error == 0) {
-        return end;
+    Opened end = OpenInPieces(folder, path);
+    if (end.error == ELOOP) {
+        end.error = ENOTDIR;  // that folder is a link
     }
-    // Too long for one call, or there is a link: step by step it is found out which.
-    end = OpenFolder(folder, ".");
-    while (end.error == 0 && !path.empty()) {
-        const std::string name(path.substr(0, path.find('/')));
-        path.remove_prefix(std::min(name.size() + 1, path.size()));
-        if (!name.empty()) {
-            end = OpenFolder(end.file.get(), name.c_str());
-        }
-    }
-    return end;
+    return end.error == ENOSYS || end.error == EPERM ? OpenStepByStep(folder, path)
+                                                     : std::move(end);
 }
 
 }  // namespace platform

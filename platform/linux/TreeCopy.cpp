@@ -94,11 +94,13 @@ private:
     int copyFolder(const ItemPlace& source, const ItemPlace& copy);
     int enter(const ItemPlace& source, const ItemPlace& copy);
     int refuseItself(const struct stat& status);
+    int beginWith(const Folder& top);
     int copyEntries();
     int finish();
     int copyEntry(const ItemPlace& source, const ItemPlace& copy, unsigned char type);
     int copyFile(const ItemPlace& source, const ItemPlace& copy);
     int copyLink(const ItemPlace& source, const ItemPlace& copy);
+    int leaveOut(const ItemPlace& source);
     int rememberName(const struct stat& status, const std::string& name);
     int leaveOut(const ItemPlace& copy, int error);
 
@@ -108,6 +110,7 @@ private:
     std::vector<Level> levels_;
     Folder::Identity top_;  ///< of the copy
     PendingFolders pending_;
+    ModeMask mask_;
     HardLinks hardLinks_;
     std::string path_;  ///< of the folder that the walk is in, below the top
 };
@@ -187,7 +190,7 @@ int TreeCopy::enter(const ItemPlace& source, const ItemPlace& copy) {
         return error;
     }
     if (levels_.empty()) {
-        error = level.copy.identify(&top_);
+        error = beginWith(level.copy);
     } else {
         path_ += source.name + "/";
     }
@@ -201,6 +204,18 @@ int TreeCopy::enter(const ItemPlace& source, const ItemPlace& copy) {
         }
     }
     return error != 0 ? error : pending_.enter();
+}
+
+/// The top of the copy. A folder with the set-group-id bit hands that and its group down: what is
+/// made here has neither from anybody.
+int TreeCopy::beginWith(const Folder& top) {
+    const int folder = top.file().get();
+    if (fchown(folder, static_cast<uid_t>(-1), getegid()) != 0 ||
+        fchmod(folder, kModeWhileUnfinished) != 0) {
+        return errno;
+    }
+    mask_ = MaskOfNewFiles(top.file());
+    return top.identify(&top_);
 }
 
 /// A copy that lies inside its source would never end.
@@ -251,13 +266,14 @@ int TreeCopy::finish() {
             return error;
         }
     }
-    return FinishCopy(level.copy.file(), level.status);
+    return FinishFolder(level.copy.file(), level.status);
 }
 
 int TreeCopy::copyFile(const ItemPlace& source, const ItemPlace& copy) {
     const OwnedFd file(openat(source.folder.get(), source.name.c_str(), kSourceFlags));
     if (!file.isOpen()) {
-        return errno;
+        const int error = errno;
+        return error == ENXIO ? leaveOut(source) : error;
     }
 
     struct stat status {};
@@ -266,7 +282,7 @@ int TreeCopy::copyFile(const ItemPlace& source, const ItemPlace& copy) {
         return errno;
     }
     if (!S_ISREG(status.st_mode)) {
-        return ESTALE;  // something else has taken its place since it was looked at
+        return leaveOut(source);
     }
     if (int error = 0; status.st_nlink > 1 && !levels_.empty() &&
                        hardLinks_.linkAgain(status, levels_.front().copy.file(), copy, &error)) {
@@ -284,9 +300,22 @@ int TreeCopy::copyFile(const ItemPlace& source, const ItemPlace& copy) {
         error = CopyUserAttributes(file, made);
     }
     if (error == 0) {
-        error = FinishCopy(made, status);
+        error = FinishFile(made, status, mask_);
     }
     return error != 0 ? error : rememberName(status, copy.name);
+}
+
+/// What its folder called a file and is none: a mount point, or put there just now.
+int TreeCopy::leaveOut(const ItemPlace& source) {
+    struct stat status {};
+
+    if (fstatat(source.folder.get(), source.name.c_str(), &status, AT_SYMLINK_NOFOLLOW) != 0) {
+        return errno;
+    }
+    if (S_ISREG(status.st_mode) || S_ISDIR(status.st_mode) || S_ISLNK(status.st_mode)) {
+        return ESTALE;
+    }
+    return levels_.empty() ? EOPNOTSUPP : 0;
 }
 
 int TreeCopy::copyLink(const ItemPlace& source, const ItemPlace& copy) {
@@ -311,6 +340,12 @@ int TreeCopy::copyLink(const ItemPlace& source, const ItemPlace& copy) {
     const std::array times{status.st_atim, status.st_mtim};
     if (symlinkat(text.data(), folder, copy.name.c_str()) != 0 ||
         utimensat(folder, copy.name.c_str(), times.data(), AT_SYMLINK_NOFOLLOW) != 0) {
+        return errno;
+    }
+    if (levels_.empty() &&
+        fchownat(
+            folder, copy.name.c_str(), static_cast<uid_t>(-1), getegid(), AT_SYMLINK_NOFOLLOW) !=
+            0) {
         return errno;
     }
     return rememberName(status, copy.name);

@@ -43,9 +43,11 @@ expect 0 --help
 says out 'Usage: lfhelper'
 says out 'Examples:'
 silent err
-for command in check-in link-carrier-bundle create-symlink remove-preference-domain \
-    'preferences get' 'preferences set' 'preferences remove' copy-file copy-log-directory \
-    move-directory copy-archive load-plist heartbeat country-code civic-address wan-ip raw; do
+for command in check-in doctor 'voicemail set-token' 'voicemail get-token' 'voicemail clear-token' \
+    'voicemail remove-all' 'voicemail is-subscribed' link-carrier-bundle create-symlink \
+    remove-preference-domain 'preferences get' 'preferences set' 'preferences remove' copy-file \
+    copy-log-directory move-directory copy-archive load-plist heartbeat radio-logging \
+    country-code civic-address wan-ip update-databases raw; do
     expect 0 --help
     says out "  $command "
     # shellcheck disable=SC2086 # a command of two words is two arguments
@@ -93,7 +95,7 @@ usage 'HEX must be pairs of hexadecimal digits' raw 1 0
 usage 'HEX must be pairs of hexadecimal digits' raw 1 0g
 usage 'the value of --claim-size must be' raw --claim-size=-1 1
 usage 'the option --complex belongs to the command raw' --complex check-in
-usage 'the option --wait belongs to the command civic-address or wan-ip' --wait country-code
+usage 'the option --wait belongs to the command update-databases, civic-address or wan-ip' --wait country-code
 usage 'too few arguments for civic-address' civic-address 51.5
 usage 'too many arguments for wan-ip' wan-ip 1
 for degrees in north '' 51.5x 0x10 1,5; do

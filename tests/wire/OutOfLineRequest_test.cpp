@@ -32,7 +32,7 @@ protected:
     /// What the bytes are worth is the handler's affair; here it counts that it was asked.
     [[nodiscard]] bool isServed(const Bytes& request, std::span<const int> descriptors = {}) const {
         const auto code = codeOf(request, descriptors);
-        return code == kSuccess || code == kFailure || code == 46;
+        return code == kSuccess || code == kFailure;
     }
 
     [[nodiscard]] std::int32_t codeWithFile(std::uint32_t announced, const OwnedFd& file) const {

@@ -212,17 +212,11 @@ const std::array<std::vector<std::int32_t>, 24> kDocumentedCodes{{
     {0}, {0}, {0}, {0}, {0}, {0},
     {0}, {0}, {0}, {0}, {0}, {0, 3, 6, 9},
 }};
+
 // clang-format on
-/// Of the routines that this build does not have.
-constexpr std::int32_t kNotSupported = 46;
-constexpr std::array kMissing{15, 16, 17, 22, 23};
 
 bool IsDocumentedCode(const RoutineLayout& layout, std::int32_t code) {
-    const int number = layout.id - 8683549;
-    if (std::ranges::find(kMissing, number) != kMissing.end()) {
-        return code == kNotSupported;
-    }
-    const auto& codes = kDocumentedCodes.at(static_cast<std::size_t>(number));
+    const auto& codes = kDocumentedCodes.at(static_cast<std::size_t>(layout.id - 8683549));
     return std::ranges::find(codes, code) != codes.end();
 }
 

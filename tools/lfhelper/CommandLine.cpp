@@ -19,15 +19,16 @@ struct KnownOption {
     }
 
     [[nodiscard]] std::string commandNames() const {
-        std::string names;
-        for (const std::string_view command : commands) {
-            names += (names.empty() || command.empty() ? "" : " or ") + std::string(command);
+        const auto end = std::ranges::find(commands, std::string_view());
+        std::string names(commands[0]);
+        for (auto command = commands.begin() + 1; command < end; ++command) {
+            names += (command + 1 == end ? " or " : ", ") + std::string(*command);
         }
         return names;
     }
 };
 
-constexpr std::array<KnownOption, 13> kKnownOptions{{
+constexpr auto kKnownOptions = std::to_array<KnownOption>({
     {"help", Takes::kNothing},
     {"version", Takes::kNothing},
     {"json", Takes::kNothing},
@@ -35,16 +36,21 @@ constexpr std::array<KnownOption, 13> kKnownOptions{{
     {"service", Takes::kValue},
     {"complex", Takes::kNothing, {"raw"}},
     {"claim-size", Takes::kValue, {"raw"}},
+    {"key", Takes::kValue, {"voicemail get-token", "voicemail set-token"}},
     {"application", Takes::kNothing, {"preferences get"}},
     {"plist", Takes::kNothing, {"preferences get"}},
     {"type", Takes::kValue, {"preferences set"}},
     {"types", Takes::kValue, {"update-databases"}},
     {"timeout", Takes::kValue, {"update-databases"}},
     {"wait", Takes::kNothing, {"update-databases", "civic-address", "wan-ip"}},
-}};
+});
 
-/// The first word of commands that have two.
-constexpr std::string_view kCommandGroup = "preferences";
+/// The first words of commands that have two.
+constexpr std::array<std::string_view, 2> kCommandGroups{"preferences", "voicemail"};
+
+bool IsCommandGroup(std::string_view word) {
+    return std::ranges::find(kCommandGroups, word) != kCommandGroups.end();
+}
 
 const KnownOption* FindKnownOption(std::string_view name) {
     const auto found = std::ranges::find(kKnownOptions, name, &KnownOption::name);
@@ -94,7 +100,7 @@ private:
         if (!hasCommand_) {
             hasCommand_ = true;
             line_.command = argument;
-        } else if (line_.command == kCommandGroup) {
+        } else if (IsCommandGroup(line_.command)) {
             line_.command.append(" ").append(argument);
         } else {
             line_.operands.emplace_back(argument);

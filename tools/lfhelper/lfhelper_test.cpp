@@ -167,8 +167,9 @@ TEST_F(LfhelperTest, TellsProgramsThatItWasNotDone) {
         runAnswered("--json copy-archive source destination", NumberReply(8683571, 0));
     EXPECT_EQ(outcome.exitStatus, 1);
     EXPECT_EQ(outcome.output,
-              "{\"command\":\"copy-archive\",\"exitStatus\":1,\"code\":0,\"name\":\"SUCCESS\","
-              "\"meaning\":\"success\",\"done\":false,\"source\":\"source\",\"destination\":"
+              "{\"command\":\"copy-archive\",\"exitStatus\":1,\"code\":null,\"name\":\"NOT_DONE\","
+              "\"meaning\":\"the service did not copy all of source to destination; its log "
+              "tells why\",\"done\":false,\"source\":\"source\",\"destination\":"
               "\"destination\"}\n");
     EXPECT_EQ(requestText(32) + " " + requestText(288), "source destination");
 }
