@@ -146,11 +146,13 @@ LF_MOBILE_HELPER_EXPORT void LFMobileHelperFree(void* data);
 
 /* ---- Voicemail tokens: texts of at most 256 bytes of UTF-8 ---------------------------------- */
 
-/* Stores the access token. FAILURE: the token is not UTF-8. */
+/* Stores the access token. The result is 0 also when the service could not write its store: its log
+ * tells. A token of 256 bytes is stored, but no reply holds it. FAILURE: the token is not UTF-8. */
 LF_MOBILE_HELPER_EXPORT int32_t LFMobileHelperSetVoicemailToken(LFMobileHelper* helper,
                                                                 const char* token);
 
-/* Stores a token under a key. FAILURE: one of them is not UTF-8. */
+/* Stores a token under a key, likewise. The service keeps at most 1024 keys. FAILURE: one of them
+ * is not UTF-8. */
 LF_MOBILE_HELPER_EXPORT int32_t LFMobileHelperSetVoicemailTokenForKey(LFMobileHelper* helper,
                                                                       const char* key,
                                                                       const char* token);
@@ -162,12 +164,11 @@ LF_MOBILE_HELPER_EXPORT int32_t LFMobileHelperClearVoicemailToken(LFMobileHelper
 LF_MOBILE_HELPER_EXPORT int32_t LFMobileHelperRemoveAllVoicemailRecords(LFMobileHelper* helper);
 
 /* Reads the token under a key into the caller's buffer, always NUL-terminated; the empty text when
- * there is none. FAILURE: the key is not UTF-8. */
+ * there is none, or one of 256 bytes. FAILURE: the key is not UTF-8. */
 LF_MOBILE_HELPER_EXPORT int32_t LFMobileHelperCopyVoicemailTokenForKey(
     LFMobileHelper* helper, const char* key, char token[LF_MOBILE_HELPER_TOKEN_SIZE]);
 
-/* Reads the access token into the caller's buffer, always NUL-terminated; the empty text when there
- * is none. */
+/* Reads the access token into the caller's buffer, likewise. */
 LF_MOBILE_HELPER_EXPORT int32_t
 LFMobileHelperCopyVoicemailToken(LFMobileHelper* helper, char token[LF_MOBILE_HELPER_TOKEN_SIZE]);
 
@@ -287,7 +288,8 @@ LF_MOBILE_HELPER_EXPORT int32_t LFMobileHelperRequestWanIPFromLocation(LFMobileH
 LF_MOBILE_HELPER_EXPORT int32_t LFMobileHelperSetHeartbeatEnabled(LFMobileHelper* helper,
                                                                   int32_t isEnabled);
 
-/* Switches the file logging of the radio manager on (other than 0) or off (0). */
+/* Switches the file logging of the radio manager on (other than 0) or off (0). The result is 0 also
+ * where no radio manager runs. */
 LF_MOBILE_HELPER_EXPORT int32_t LFMobileHelperSetRadioManagerLogging(LFMobileHelper* helper,
                                                                      int32_t isEnabled);
 

@@ -1,6 +1,6 @@
 #include "lasd/DatabaseFiles.h"
 
-#include "lasd/UpdaterTest.h"
+#include "lasd/Updater_test.h"
 
 using namespace updater_test;
 

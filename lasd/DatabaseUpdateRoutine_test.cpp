@@ -1,6 +1,6 @@
 #include "Helper/Shared/Server/HelperServerUtils.h"
 #include "Helper/Shared/Server/RequestProtocol.h"
-#include "lasd/UpdaterTest.h"
+#include "lasd/Updater_test.h"
 #include "tests/support/TestClient.h"
 
 using namespace updater_test;

@@ -1,6 +1,6 @@
 #include "lasd/DatabaseVersions.h"
 
-#include "lasd/UpdaterTest.h"
+#include "lasd/Updater_test.h"
 #include "platform/Preferences.h"
 
 using namespace updater_test;

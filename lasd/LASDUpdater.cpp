@@ -1,7 +1,6 @@
 #include "lasd/LASDUpdater.h"
 
-#include <span>
-#include <string_view>
+#include <utility>
 
 #include "lasd/DatabaseFiles.h"
 #include "lasd/HttpFetcher.h"
@@ -41,13 +40,24 @@ private:
     const std::uint32_t token_;
 };
 
+/// One check's place among those under way, given back with the last copy. Null when all are taken.
+std::shared_ptr<void> TakePlace(const std::shared_ptr<std::atomic<std::uint32_t>>& taken) {
+    if (++*taken > LASDUpdater::kChecksMax) {
+        --*taken;
+        return nullptr;
+    }
+    return {taken.get(), [taken](std::atomic<std::uint32_t>* /*count*/) { --*taken; }};
+}
+
 // Queue threads may use it until the process is gone. At exit this pointer is let go of, but the
 // object is destroyed by a task of its queue, and from main's return no queue starts one.
 const std::shared_ptr<LASDUpdater> updaterOfTheProcess = LASDUpdater::create();
 
 }  // namespace
 
-LASDUpdater::LASDUpdater() : SharedSynchronizable("LASDUpdater") {}
+LASDUpdater::LASDUpdater()
+    : SharedSynchronizable("LASDUpdater"),
+      checksUnderWay_(std::make_shared<std::atomic<std::uint32_t>>(0)) {}
 
 LASDUpdater& LASDUpdater::shared() {
     return *updaterOfTheProcess;
@@ -55,8 +65,15 @@ LASDUpdater& LASDUpdater::shared() {
 
 void LASDUpdater::checkForUpdate(MobileHelperServer* server, std::uint32_t mask) {
     Log(LogLevel::kInfo, "Trying to see if update available for mask %x", mask);
+    auto place = TakePlace(checksUnderWay_);
+    if (place == nullptr) {
+        Log(LogLevel::kError, "database check dropped: %u are under way", kChecksMax);
+        return;
+    }
     const std::uint32_t hold = ServerHoldAcquire(server);
-    submit([this, server, mask, hold] { runUpdateCheck(server, mask, hold); });
+    submit([this, server, mask, hold, place = std::move(place)] {
+        runUpdateCheck(server, mask, hold);
+    });
 }
 
 void LASDUpdater::runUpdateCheck(MobileHelperServer* server,

@@ -1,6 +1,7 @@
 // Brings the service databases up to date: which ones the server has newer, and their installation.
 #pragma once
 
+#include <atomic>
 #include <cstdint>
 #include <memory>
 #include <string>
@@ -27,6 +28,10 @@ public:
     /// its queue is at then goes on or not, and finds everything in place.
     [[nodiscard]] static LASDUpdater& shared();
 
+    /// Checks that wait or run; more are dropped with an error line, or a client that asks faster
+    /// than we work would fill our memory.
+    static constexpr std::uint32_t kChecksMax = 4096;
+
     /// Has the databases of the mask checked, and a hold keep the process until that is done. From
     /// any thread.
     void checkForUpdate(MobileHelperServer* server, std::uint32_t mask);
@@ -52,5 +57,6 @@ private:
     void updateDatabases(MobileHelperServer* server, std::uint32_t types);
     [[nodiscard]] bool record(DatabaseType type);
 
+    const std::shared_ptr<std::atomic<std::uint32_t>> checksUnderWay_;
     DatabaseVersions versions_;  // on the work queue
 };

@@ -2,7 +2,7 @@
 
 #include "Helper/Shared/Server/MessageLayouts.h"
 #include "Helper/Shared/Server/RequestProtocol.h"
-#include "lasd/UpdaterTest.h"
+#include "lasd/Updater_test.h"
 
 using namespace updater_test;
 
@@ -449,6 +449,22 @@ TEST_F(Updater, WorksOffOneRequestAfterTheOther) {
     Words expected(200, "NoUpdateRequired");
     expected.front() = "UpdateAvailable gsm";
     EXPECT_EQ(Heard(), expected);
+}
+
+TEST_F(Updater, DropsWhatComesWhileTooManyRequestsWait) {
+    for (std::uint32_t i = 0; i < LASDUpdater::kChecksMax; ++i) {
+        updater->checkForUpdate(server, kGsm);
+    }
+    sim::ClearLogs();
+    updater->checkForUpdate(server, kLte);
+    const Lines expected{Info("Trying to see if update available for mask 4"),
+                         Error("database check dropped: 4096 are under way")};
+    EXPECT_EQ(sim::UnifiedLog(), expected);
+    sim::OpenMessagePort(kPort, 2 * LASDUpdater::kChecksMax);
+    sim::Settle();
+    updater->checkForUpdate(server, kGsm);
+    sim::Settle();
+    EXPECT_EQ(Heard(), Words(LASDUpdater::kChecksMax + 1, "UpdateFailed"));
 }
 
 TEST_F(Updater, IsThereBeforeMainForTheWholeProcess) {

@@ -1,6 +1,6 @@
 #include "lasd/Notifications.h"
 
-#include "lasd/UpdaterTest.h"
+#include "lasd/Updater_test.h"
 
 using namespace updater_test;
 

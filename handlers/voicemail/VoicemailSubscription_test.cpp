@@ -2,6 +2,10 @@
 
 #include <gtest/gtest.h>
 
+#include <atomic>
+#include <latch>
+#include <thread>
+
 #include "Helper/Shared/Server/RequestProtocol.h"
 #include "platform/sim/Sim.h"
 #include "platform/sim/SimLibraries.h"
@@ -12,7 +16,7 @@ constexpr const char* kLibrary = "/usr/lib/linefold/libVisualVoicemail.so";
 constexpr const char* kSymbol = "_MBSharedServiceIsSubscribed";
 
 unsigned char answer = 0;
-int questions = 0;
+std::atomic<int> questions = 0;
 
 unsigned char IsSubscribed() {
     ++questions;
@@ -91,6 +95,25 @@ TEST_F(VoicemailSubscriptionTest, IsFalseForGoodWhenTheLookUpFailed) {
         EXPECT_FALSE(subscription.isSubscribed()) << call;
     }
     EXPECT_TRUE(subscription_.isSubscribed());
+}
+
+TEST_F(VoicemailSubscriptionTest, IsLookedUpOnceForThreadsThatAskAtOnce) {
+    makeLibrary();
+    answer = 1;
+    std::atomic<int> subscribed = 0;
+    {
+        std::latch start(8);
+        std::vector<std::jthread> threads;
+        for (int i = 0; i < 8; ++i) {
+            threads.emplace_back([this, &start, &subscribed] {
+                start.arrive_and_wait();
+                subscribed += subscription_.isSubscribed() ? 1 : 0;
+            });
+        }
+    }
+    EXPECT_EQ(subscribed, 8);
+    EXPECT_EQ(questions, 8);
+    EXPECT_EQ(sim::JournalCount("DynamicLibrary.open"), 1U);
 }
 
 /// The routine's own record lasts for the process, so this is the one test that asks it.

@@ -41,10 +41,10 @@ bool IsWhole(const Decoded& decoded) {
 
 /// Two members with an empty one in between, more than the decoder's buffer in all.
 std::string Members() {
-    return Gzip(std::string(300'000, 'a') + "end") + Gzip("") + Gzip("second");
+    return Gzip(std::string(600'000, 'a') + "end") + Gzip("") + Gzip("second");
 }
 
-const std::string kMembersText = std::string(300'000, 'a') + "endsecond";
+const std::string kMembersText = std::string(600'000, 'a') + "endsecond";
 
 TEST(GzipDecoder, DecodesAllMembers) {
     const auto decoded = Decode(Members());

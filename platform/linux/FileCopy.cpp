@@ -8,6 +8,8 @@
 #include <array>
 #include <cerrno>
 #include <climits>
+#include <cstdlib>
+#include <cstring>
 #include <span>
 #include <string_view>
 #include <vector>
@@ -21,6 +23,7 @@ constexpr std::size_t kBufferSize = 64 << 10;
 constexpr off_t kMostAtOnce = 1 << 30;
 constexpr off_t kBytesOfBlock = 512;
 constexpr std::string_view kUserAttributes = "user.";
+constexpr auto kAsItIs = static_cast<uid_t>(-1);
 
 /// What a kernel or a pair of file systems answers that cannot copy for us.
 bool IsUnableToCopy(int error) {
@@ -118,6 +121,11 @@ int CopyAttribute(const OwnedFd& source, const char* name, const OwnedFd& copy) 
                : errno;
 }
 
+int SetTimes(const OwnedFd& copy, const struct stat& status) {
+    const std::array times{status.st_atim, status.st_mtim};
+    return futimens(copy.get(), times.data()) == 0 ? 0 : errno;
+}
+
 }  // namespace
 
 int CopyContents(const OwnedFd& source, const struct stat& status, const OwnedFd& copy) {
@@ -160,23 +168,42 @@ mode_t ModeOfCopy(const struct stat& status) {
     return status.st_mode & (S_IRWXU | S_IRWXG | S_IRWXO | S_ISVTX);
 }
 
-int FinishCopy(const OwnedFd& copy, const struct stat& status) {
-    constexpr mode_t kModeBits = 07777;
+ModeMask MaskOfNewFiles(const OwnedFd& folder) {
+    if (fgetxattr(folder.get(), "system.posix_acl_default", nullptr, 0) >= 0) {
+        return {};
+    }
+    // The only way to read it without changing it under other threads.
+    constexpr std::string_view kKey = "\nUmask:";
+    const OwnedFd status(open("/proc/self/status", O_RDONLY | O_CLOEXEC));
+    std::array<char, 1024> text{};
+    const ssize_t length = read(status.get(), text.data(), text.size() - 1);
+    const char* const found = length > 0 ? std::strstr(text.data(), kKey.data()) : nullptr;
+    if (found == nullptr) {
+        return {};
+    }
+    return {.isKnown = true,
+            .bits = static_cast<mode_t>(std::strtoul(found + kKey.size(), nullptr, 8))};
+}
 
-    struct stat made {};
+int FinishFile(const OwnedFd& copy, const struct stat& status, const ModeMask& mask) {
+    const mode_t mode = ModeOfCopy(status);
+    bool hasMode = (mode & (mask.bits | S_ISVTX)) == 0;
+    if (!mask.isKnown) {
+        constexpr mode_t kModeBits = 07777;
 
-    if (fstat(copy.get(), &made) != 0) {
-        return errno;
+        struct stat made {};
+
+        if (fstat(copy.get(), &made) != 0 ||
+            (made.st_gid != getegid() && fchown(copy.get(), kAsItIs, getegid()) != 0)) {
+            return errno;
+        }
+        hasMode = (made.st_mode & kModeBits) == mode;
     }
-    if (made.st_gid != getegid() && fchown(copy.get(), static_cast<uid_t>(-1), getegid()) != 0) {
-        return errno;
-    }
-    if ((made.st_mode & kModeBits) != ModeOfCopy(status) &&
-        fchmod(copy.get(), ModeOfCopy(status)) != 0) {
-        return errno;
-    }
-    const std::array times{status.st_atim, status.st_mtim};
-    return futimens(copy.get(), times.data()) == 0 ? 0 : errno;
+    return hasMode || fchmod(copy.get(), mode) == 0 ? SetTimes(copy, status) : errno;
+}
+
+int FinishFolder(const OwnedFd& copy, const struct stat& status) {
+    return fchmod(copy.get(), ModeOfCopy(status)) == 0 ? SetTimes(copy, status) : errno;
 }
 
 }  // namespace platform

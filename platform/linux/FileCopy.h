@@ -21,8 +21,21 @@ namespace platform {
 /// What a copy keeps of a mode: the permissions, and not the set-id bits.
 [[nodiscard]] mode_t ModeOfCopy(const struct stat& status);
 
-/// Gives a new file or folder this process's group, whatever its folder says of new things, then
-/// the mode and the times of what it is a copy of.
-[[nodiscard]] int FinishCopy(const OwnedFd& copy, const struct stat& status);
+/// What the system takes from the mode of new files in a folder.
+struct ModeMask {
+    bool isKnown = false;  ///< otherwise each new file is to be looked at
+    mode_t bits = 0;
+};
+
+/// Of a folder that hands no group down. Not known where the folder hands an access control list
+/// down.
+[[nodiscard]] ModeMask MaskOfNewFiles(const OwnedFd& folder);
+
+/// Gives a new file the mode and the times of what it is a copy of, and this process's group where
+/// the mask is not known.
+[[nodiscard]] int FinishFile(const OwnedFd& copy, const struct stat& status, const ModeMask& mask);
+
+/// The same for a folder that was made with another mode.
+[[nodiscard]] int FinishFolder(const OwnedFd& copy, const struct stat& status);
 
 }  // namespace platform

@@ -61,15 +61,21 @@ bool TakeRecords(const PropertyList* list, MailboxRecords& records) {
            });
 }
 
-}  // namespace
-
-const std::string* MailboxRecords::find(std::string_view key) const {
-    const auto found = std::ranges::find(records, key, &Record::key);
+/// For records that may be changed, and for those that may not.
+template <typename Records>
+auto TokenIn(Records& records, std::string_view key) -> decltype(&records.front().token) {
+    const auto found = std::ranges::find(records, key, &MailboxRecords::Record::key);
     return found == records.end() ? nullptr : &found->token;
 }
 
+}  // namespace
+
+const std::string* MailboxRecords::find(std::string_view key) const {
+    return TokenIn(records, key);
+}
+
 std::string* MailboxRecords::find(std::string_view key) {
-    return const_cast<std::string*>(std::as_const(*this).find(key));
+    return TokenIn(records, key);
 }
 
 PropertyList PropertyListOf(const MailboxRecords& records) {

@@ -97,6 +97,7 @@ public:
 
     Store(const Store&) = delete;
     Store& operator=(const Store&) = delete;
+    ~Store() = default;
 
     [[nodiscard]] bool isDamaged() const { return contents_.state == State::kDamaged; }
 

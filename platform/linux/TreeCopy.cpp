@@ -110,6 +110,7 @@ private:
     std::vector<Level> levels_;
     Folder::Identity place_;  ///< of the folder that the copy is made in
     PendingFolders pending_;
+    ModeMask mask_;
     HardLinks hardLinks_;
     std::string path_;  ///< of the folder that the walk is in, below the top
 };
@@ -217,6 +218,7 @@ int TreeCopy::beginWith(const Folder& top) {
         fchmod(folder, kModeWhileUnfinished) != 0) {
         return errno;
     }
+    mask_ = MaskOfNewFiles(top.file());
     return 0;
 }
 
@@ -268,7 +270,7 @@ int TreeCopy::finish() {
             return error;
         }
     }
-    return FinishCopy(level.copy.file(), level.status);
+    return FinishFolder(level.copy.file(), level.status);
 }
 
 int TreeCopy::copyFile(const ItemPlace& source, const ItemPlace& copy) {
@@ -302,7 +304,7 @@ int TreeCopy::copyFile(const ItemPlace& source, const ItemPlace& copy) {
         error = CopyUserAttributes(file, made);
     }
     if (error == 0) {
-        error = FinishCopy(made, status);
+        error = FinishFile(made, status, mask_);
     }
     return error != 0 ? error : rememberName(status, copy.name);
 }

@@ -209,6 +209,10 @@ std::uint32_t Attacker::random(std::size_t below) {
     return seed_ % static_cast<std::uint32_t>(below);
 }
 
+std::vector<std::string> SwappedPlaces() {
+    return Places();
+}
+
 std::vector<std::string> PathsThroughSwappedPlaces() {
     std::vector<std::string> paths;
     for (const auto& place : Places()) {

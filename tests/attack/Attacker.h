@@ -37,6 +37,9 @@ private:
     std::thread thread_;  // the last one: it uses the others
 };
 
+/// The places that are swapped.
+[[nodiscard]] std::vector<std::string> SwappedPlaces();
+
 /// Paths through the places that are swapped, one for each thing that can be removed or made.
 [[nodiscard]] std::vector<std::string> PathsThroughSwappedPlaces();
 

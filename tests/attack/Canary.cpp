@@ -29,6 +29,14 @@ std::string ContentsOf(const std::string& path, const struct stat& status) {
     return {std::istreambuf_iterator<char>(file), std::istreambuf_iterator<char>()};
 }
 
+void FillFiles(const std::string& root) {
+    for (const auto& entry : fs::recursive_directory_iterator(root)) {
+        if (entry.is_regular_file() && !entry.is_symlink()) {
+            std::ofstream(entry.path()) << kCanaryContents;
+        }
+    }
+}
+
 void GiveToCanaryGroup(const std::string& root) {
     for (const auto& entry : fs::recursive_directory_iterator(root)) {
         if (lchown(entry.path().c_str(), 0, kCanaryGroup) != 0) {
@@ -63,6 +71,7 @@ void MakeCanary() {
     for (const char* name : {"/open", "/secret"}) {
         MakeLibraryLikeFolder(std::string(kCanary) + name);
     }
+    FillFiles(kCanary);
     GiveToCanaryGroup(kCanary);
     fs::permissions(std::string(kCanary) + "/secret", fs::perms(0700));
 }

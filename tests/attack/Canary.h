@@ -12,6 +12,8 @@ namespace attack {
 inline constexpr const char* kCanary = "/private/canary";
 /// The group of all that is in the canary, and of nothing else: who sees it was led there.
 inline constexpr gid_t kCanaryGroup = 4242;
+/// What its files hold: who holds it was led there, too.
+inline constexpr const char* kCanaryContents = "the canary's";
 
 /// What may be removed from a folder: a file, a link, an empty folder, and one that is not empty.
 /// The canary has each of them under the names that requests use for their own.

@@ -21,5 +21,17 @@ TEST(NaivePathAccessUnderAttack, IsLedToWhatIsNotTheMobileUsers) {
     EXPECT_TRUE(sawCanary);
 }
 
+TEST(NaiveFileManagerUnderAttack, IsLedToWhatIsNotTheMobileUsers) {
+    bool wasDamaged = false;
+    bool sawCanary = false;
+    for (int round = 0; round < kRoundsMax && !(wasDamaged && sawCanary); ++round) {
+        const Outcome outcome = AttackFileManager(5'000 / kScale);
+        wasDamaged |= !outcome.damage.empty();
+        sawCanary |= outcome.sawCanary > 0;
+    }
+    EXPECT_TRUE(wasDamaged);
+    EXPECT_TRUE(sawCanary);
+}
+
 }  // namespace
 }  // namespace attack

@@ -43,9 +43,11 @@ expect 0 --help
 says out 'Usage: lfhelper'
 says out 'Examples:'
 silent err
-for command in check-in link-carrier-bundle create-symlink remove-preference-domain \
-    'preferences get' 'preferences set' 'preferences remove' copy-file copy-log-directory \
-    move-directory copy-archive load-plist heartbeat country-code civic-address wan-ip raw; do
+for command in check-in doctor 'voicemail set-token' 'voicemail get-token' 'voicemail clear-token' \
+    'voicemail remove-all' 'voicemail is-subscribed' link-carrier-bundle create-symlink \
+    remove-preference-domain 'preferences get' 'preferences set' 'preferences remove' copy-file \
+    copy-log-directory move-directory copy-archive load-plist heartbeat radio-logging \
+    country-code civic-address wan-ip update-databases raw; do
     expect 0 --help
     says out "  $command "
     # shellcheck disable=SC2086 # a command of two words is two arguments

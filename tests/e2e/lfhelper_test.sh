@@ -5,45 +5,10 @@ set -u
 # What is read from a pipe is run and counted here, too.
 shopt -s lastpipe
 
-lfhelper=$LINEFOLD_BUILD/bin/lfhelper
-service=com.vendra.linefold.mobile-helper
-socket=/run/linefold/$service
+. "$(dirname "$0")/../support/lfhelper.sh"
 library=/private/var/mobile/Library
 domain=com.vendra.test
 file=$library/Preferences/$domain.plist
-failures=0
-
-fail() {
-    failures=$((failures + 1))
-    echo "FAILED: $1"
-    head -c 500 /tmp/out | sed 's/^/    stdout: /'
-    head -c 500 /tmp/err | sed 's/^/    stderr: /'
-}
-
-# exits STATUS ARGUMENT...: runs lfhelper, whose input is this function's.
-exits() {
-    local wanted=$1
-    shift
-    what="lfhelper $*"
-    timeout 30 "$lfhelper" "$@" >/tmp/out 2>/tmp/err
-    local status=$?
-    [ "$status" -eq "$wanted" ] || fail "$what: exit status $status, not $wanted"
-}
-
-# About the last run: the whole output, a part of the errors, no output or errors at all.
-prints() { printf '%s\n' "$1" | cmp -s - /tmp/out || fail "$what: does not print: $1"; }
-says() { grep -qF -e "$1" /tmp/err || fail "$what: does not say: $1"; }
-silent() { [ ! -s "/tmp/$1" ] || fail "$what: std$1 is not empty"; }
-
-# json FILTER: the output is one JSON object, of which the filter is true.
-json() {
-    [ "$(wc -l </tmp/out)" -eq 1 ] || fail "$what: not one line of JSON"
-    jq -e "$1" /tmp/out >/tmp/jq 2>&1 || fail "$what: not so in its JSON: $1"
-}
-
-expect() { # WHAT EXPECTED FOUND
-    [ "$2" = "$3" ] || fail "$1: expected '$2', found '$3'"
-}
 
 plist() {
     printf '<?xml version="1.0" encoding="UTF-8"?>\n<plist version="1.0">\n%s\n</plist>\n' "$1"
@@ -276,13 +241,7 @@ only_the_entitled_are_served() {
 }
 
 nobody_listens
-"$LINEFOLD_BUILD/bin/activator" "$socket" "$service" "$LINEFOLD_BUILD/bin/LinefoldMobileHelper" &
-activator=$!
-trap 'kill "$activator"' EXIT
-for _ in {1..200}; do
-    [ -S "$socket" ] && break
-    sleep 0.05
-done
+serve
 plain_values_come_back_as_they_were_set
 other_values_come_back_as_property_lists
 standard_input_is_a_value
@@ -300,5 +259,4 @@ files_that_cannot_be_put_into_place_are_told
 property_list_files_are_shown
 raw_messages_are_answered
 only_the_entitled_are_served
-[ "$failures" = 0 ] && echo "lfhelper and the daemon agree"
-exit $((failures != 0))
+finish "lfhelper and the daemon agree"

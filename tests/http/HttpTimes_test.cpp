@@ -3,12 +3,10 @@
 #include <arpa/inet.h>
 #include <gtest/gtest.h>
 #include <netinet/in.h>
-#include <sys/resource.h>
 #include <sys/socket.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include "platform/Semaphore.h"
 #include "tests/http/ConfigurationServer.h"
 #include "tests/http/Fetch.h"
 #include "tests/http/RawServer.h"
@@ -78,44 +76,6 @@ TEST(HttpTimes, EndAnAnswerThatTricklesForEver) {
         }
     });
     EXPECT_EQ(ErrorOf(server.url()), ErrorType::kTimedOut);
-}
-
-std::size_t PeakOfMemory() {
-    rusage usage{};
-    getrusage(RUSAGE_SELF, &usage);
-    return static_cast<std::size_t>(usage.ru_maxrss) * 1024;
-}
-
-/// Starts a request whose body is looked at in place.
-std::size_t SizeOfBody(const std::string& url) {
-    const auto request = hvu::Http::HttpRequest::create(
-        hvu::Http::RequestType::kGet, url, {}, hvu::Http::HttpSession::create());
-    const auto isDone = platform::Semaphore::create();
-    std::size_t size = 0;
-    request->setCompletionQueue(platform::SerialQueue("completions"));
-    request->setCompletionHandler([&](const std::shared_ptr<hvu::Http::HttpResponse>& response) {
-        size = response->takeBody().size();
-        isDone->signal();
-    });
-    request->start({});
-    isDone->wait();
-    return size;
-}
-
-TEST(HttpMemory, HoldsABodyOfUnknownSizeOnce) {
-    constexpr std::size_t kChunks = 100;
-    constexpr std::size_t kMiB = 1UL << 20;
-    const std::string chunk = "100000\r\n" + std::string(kMiB, 'x') + "\r\n";
-    const RawServer server([&](const RawConnection& client) {
-        (void)client.send("HTTP/1.1 200 OK\r\nTransfer-Encoding: chunked\r\n\r\n");
-        for (std::size_t i = 0; i < kChunks; ++i) {
-            (void)client.send(chunk);
-        }
-        (void)client.send("0\r\n\r\n");
-    });
-    const std::size_t before = PeakOfMemory();
-    EXPECT_EQ(SizeOfBody(server.url()), kChunks * kMiB);
-    EXPECT_LT(PeakOfMemory() - before, (kChunks + 8) * kMiB);
 }
 
 /// The exit status of the program that fetches, or minus the signal's number.

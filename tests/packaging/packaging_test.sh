@@ -39,6 +39,8 @@ if [ "$(id -u)" = 0 ]; then
     [ "$(readlink "$root/phone/var/mobile")" = ../private/var/mobile ] || fail "/var/mobile is no link"
     [ "$(stat -c %u "$root/phone/private/var/mobile/Library/Carrier Bundles")" = 501 ] ||
         fail "the carrier bundles are not the mobile user's"
+    [ "$(stat -c '%a %u' "$root/phone/private/var/db/linefold")" = '700 0' ] ||
+        fail "the folder of the voicemail tokens is open to others"
 fi
 
 [ "$failures" = 0 ] || exit 1

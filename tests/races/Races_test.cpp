@@ -2,7 +2,9 @@
 // the middle of it.
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <atomic>
+#include <csignal>
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
@@ -71,8 +73,44 @@ std::string Reports(const fs::path& folder) {
     return reports;
 }
 
+/// A simulated service, until the end of the object.
+class Simulator {
+public:
+    Simulator(const std::string& words, const std::string& network)
+        : log_("/tmp/simulator-" + words) {
+        const std::string command = (network.empty() ? "" : "nsenter --net=" + network + " ") +
+                                    phone::ProgramPath("linefold-sim") + " " + words + " >" + log_ +
+                                    " 2>&1 & echo $! >" + log_ + ".pid";
+        EXPECT_EQ(std::system(command.c_str()), 0);
+        EXPECT_TRUE(phone::Eventually([&] { return Read(log_).starts_with("ready"); })) << words;
+        pid_ = std::stoi(Read(log_ + ".pid"));
+    }
+
+    Simulator(const Simulator&) = delete;
+    Simulator& operator=(const Simulator&) = delete;
+
+    ~Simulator() { kill(pid_, SIGTERM); }
+
+    /// What it has said so far.
+    [[nodiscard]] std::ptrdiff_t lines() const { return std::ranges::count(Read(log_), '\n'); }
+
+private:
+    const std::string log_;
+    pid_t pid_ = 0;
+};
+
+constexpr const char* kGateway = "/run/netns/gateway";
+constexpr const char* kPlatform =
+    "<plist version=\"1.0\"><dict><key>CountryCode</key><string>DE</string>"
+    "<key>ReverseGeocodeURL</key><string>http://198.51.100.1:8080/reverse</string>"
+    "<key>StunServer</key><string>198.51.100.1:3478</string></dict></plist>";
+
 TEST(Races, AreNotBetweenTheMainLoopAndTheQueues) {
     phone::ResetMobileHome();
+    std::ofstream("/etc/linefold/platform.plist") << kPlatform;
+    const Simulator telephony("telephony", "");
+    const Simulator geocoder("geocoder", kGateway);
+    const Simulator stun("stun", kGateway);
     fs::create_directories("/tmp/reports");
     setenv("TSAN_OPTIONS", "log_path=/tmp/reports/report exitcode=66", 1);
     for (int life = 0; life < kLives; ++life) {
@@ -82,7 +120,10 @@ TEST(Races, AreNotBetweenTheMainLoopAndTheQueues) {
         for (int i = 0; i < kClients; ++i) {
             clients.emplace_back([&answers, i] { BeAClient(i, answers); });
         }
-        EXPECT_TRUE(phone::Eventually([&] { return answers > 50 * (life + 1); }));
+        const auto reports = telephony.lines();
+        EXPECT_TRUE(phone::Eventually([&] {
+            return answers > 50 * (life + 1) && telephony.lines() > reports + life % 3;
+        })) << "nothing reaches the telephony daemon";
         daemon.signal(SIGTERM);
         EXPECT_EQ(daemon.waitForExit(), 0) << Reports("/tmp/reports");
         for (auto& client : clients) {

@@ -139,6 +139,11 @@ void HelperWorld::terminate() {
 
 void HelperWorld::killClients() {
     for (const auto& client : clients_) {
+        // An instance that was told to end may still wait for a queue's task to end.
+        const bool isEnding = server_ == nullptr || server_->stopRequested != 0;
+        if (!client->isAnswered() && isEnding) {
+            diedWaiting_.insert(client.get());
+        }
         client->die();
     }
     scriptEnded();
@@ -177,7 +182,8 @@ void HelperWorld::checkPortTable() {
 
 void HelperWorld::expectEverybodyServed() const {
     for (const auto& client : clients_) {
-        EXPECT_TRUE(client->isAnswered()) << client->client.identity.pid;
+        EXPECT_TRUE(client->isAnswered() || diedWaiting_.contains(client.get()))
+            << client->client.identity.pid;
         happened_.connectedAgain += client->connections() > 1 ? 1 : 0;
     }
 }

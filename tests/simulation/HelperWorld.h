@@ -90,6 +90,7 @@ private:
     const Shape shape_;
     Happenings& happened_;
     std::vector<std::unique_ptr<PatientClient>> clients_;
+    std::set<const PatientClient*> diedWaiting_;
     MobileHelperServer* server_ = nullptr;
     std::set<platform::mach_port_t> seenNames_;
     bool wasToldToEnd_ = false;

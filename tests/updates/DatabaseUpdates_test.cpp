@@ -75,6 +75,8 @@ Lines Installing(const std::string& file) {
 
 class DatabaseUpdates : public testing::Test {
 protected:
+    static void SetUpTestSuite() { ForgetOtherAuthorities(); }
+
     DatabaseUpdates() {
         phone::ResetMobileHome();
         fs::remove_all("/run/www");

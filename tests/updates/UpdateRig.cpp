@@ -14,6 +14,10 @@ const std::string kRecordFile =
 
 }  // namespace
 
+void ForgetOtherAuthorities() {
+    std::filesystem::resize_file("/etc/ssl/certs/ca-certificates.crt", 0);
+}
+
 std::string Xml(const PropertyList& value) {
     const auto data = platform::PropertyListCreateXmlData(value).value();
     return {reinterpret_cast<const char*>(data.data()), data.size()};

@@ -23,6 +23,10 @@ inline const std::string kOrigin = web::ConfigurationServer::kOrigin;
 inline const std::string kIndexUrl = kOrigin + "/1/v3/lasd.plist";
 inline const std::string kFolder = "/var/mobile/Library/LASD";
 
+/// Before the configuration server starts: the phone will know its authority alone. To read all
+/// that a machine trusts takes longer than the rest of an update.
+void ForgetOtherAuthorities();
+
 [[nodiscard]] std::string Xml(const PropertyList& value);
 
 /// What a file holds; "(no file)" when there is none.

@@ -36,6 +36,7 @@ constexpr auto kKnownOptions = std::to_array<KnownOption>({
     {"service", Takes::kValue},
     {"complex", Takes::kNothing, {"raw"}},
     {"claim-size", Takes::kValue, {"raw"}},
+    {"key", Takes::kValue, {"voicemail get-token", "voicemail set-token"}},
     {"application", Takes::kNothing, {"preferences get"}},
     {"plist", Takes::kNothing, {"preferences get"}},
     {"type", Takes::kValue, {"preferences set"}},
@@ -44,8 +45,12 @@ constexpr auto kKnownOptions = std::to_array<KnownOption>({
     {"wait", Takes::kNothing, {"update-databases", "civic-address", "wan-ip"}},
 });
 
-/// The first word of commands that have two.
-constexpr std::string_view kCommandGroup = "preferences";
+/// The first words of commands that have two.
+constexpr std::array<std::string_view, 2> kCommandGroups{"preferences", "voicemail"};
+
+bool IsCommandGroup(std::string_view word) {
+    return std::ranges::find(kCommandGroups, word) != kCommandGroups.end();
+}
 
 const KnownOption* FindKnownOption(std::string_view name) {
     const auto found = std::ranges::find(kKnownOptions, name, &KnownOption::name);
@@ -95,7 +100,7 @@ private:
         if (!hasCommand_) {
             hasCommand_ = true;
             line_.command = argument;
-        } else if (line_.command == kCommandGroup) {
+        } else if (IsCommandGroup(line_.command)) {
             line_.command.append(" ").append(argument);
         } else {
             line_.operands.emplace_back(argument);

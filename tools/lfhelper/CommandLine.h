@@ -15,7 +15,7 @@ struct CommandLine {
         std::string value;
     };
 
-    /// Empty when there is none; of "preferences", the word behind it belongs to the command.
+    /// Empty when there is none; of "preferences" and "voicemail", the word behind belongs to it.
     std::string command;
     std::vector<std::string> operands;
     std::vector<Option> options;

@@ -19,7 +19,7 @@ public:
 
     void add(std::string_view key, const JsonObject& object) { addRaw(key, object.toString()); }
 
-    /// A number or a boolean that is spelled as JSON spells it.
+    /// A number, a boolean or an array that is spelled as JSON spells it.
     void addLiteral(std::string_view key, std::string_view literal) { addRaw(key, literal); }
 
     void addNull(std::string_view key) { addRaw(key, "null"); }

@@ -20,15 +20,22 @@ std::optional<double> ParseDegrees(std::string_view text) {
     return error == std::errc{} && rest == end ? std::optional(degrees) : std::nullopt;
 }
 
+/// The key of a message as programs find it in our JSON: "countryCode".
+std::string JsonKey(std::string_view key) {
+    std::string name(key);
+    name.front() = static_cast<char>(name.front() - 'A' + 'a');
+    return name;
+}
+
 /// The texts of a report, one line each for people.
 Answer AnswerOfReport(const TelephonyMessage& report) {
     Answer answer;
     for (const auto& text : report.texts) {
         answer.text += std::string(text.name) + ": " + text.value.value_or("(absent)") + "\n";
         if (text.value) {
-            answer.fields.add(text.key, *text.value);
+            answer.fields.add(JsonKey(text.key), *text.value);
         } else {
-            answer.fields.addNull(text.key);
+            answer.fields.addNull(JsonKey(text.key));
         }
     }
     return answer;

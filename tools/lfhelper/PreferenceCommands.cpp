@@ -59,24 +59,6 @@ Answer GetValue(LFMobileHelper* helper, CopyValue copyValue, const Place& place,
     return answer;
 }
 
-struct ValueText {
-    std::string text;
-    std::string error{};
-};
-
-/// The operand, or what standard input holds in its place.
-ValueText ReadValueText(const std::string& operand, ValueType type) {
-    if (operand != "-") {
-        return {.text = operand};
-    }
-    auto input = ReadStandardInput(LF_MOBILE_HELPER_MAX_VALUE_SIZE);
-    // What is typed or echoed ends in a line feed that nobody means, as does what "get" prints.
-    if (type != ValueType::kPlist && input.content.ends_with('\n')) {
-        input.content.pop_back();
-    }
-    return {.text = std::move(input.content), .error = std::move(input.error)};
-}
-
 }  // namespace
 
 Preparation PreparePreferencesGet(const CommandLine& line) {
@@ -93,11 +75,14 @@ Preparation PreparePreferencesSet(const CommandLine& line) {
     if (!type) {
         return {.error = "the value of --type must be one of " + ValueTypeNames()};
     }
-    const ValueText value = ReadValueText(line.operands[2], *type);
+    const bool isText = *type != ValueType::kPlist;
+    const Input value = ReadOperand(line.operands[2],
+                                    LF_MOBILE_HELPER_MAX_VALUE_SIZE,
+                                    isText ? LastLineFeed::kDropped : LastLineFeed::kKept);
     if (!value.error.empty()) {
         return {.error = value.error};
     }
-    const SerializedValue serialized = SerializeValue(*type, value.text);
+    const SerializedValue serialized = SerializeValue(*type, value.content);
     if (!serialized.error.empty()) {
         return {.error = serialized.error};
     }

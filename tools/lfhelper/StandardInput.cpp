@@ -32,4 +32,15 @@ Input ReadStandardInput(std::size_t sizeMax) {
     }
 }
 
+Input ReadOperand(const std::string& operand, std::size_t sizeMax, LastLineFeed lineFeed) {
+    if (operand != "-") {
+        return {.content = operand};
+    }
+    Input input = ReadStandardInput(sizeMax);
+    if (lineFeed == LastLineFeed::kDropped && input.content.ends_with('\n')) {
+        input.content.pop_back();
+    }
+    return input;
+}
+
 }  // namespace lfhelper

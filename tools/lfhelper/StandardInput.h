@@ -1,4 +1,4 @@
-// Standard input, read as a whole.
+// Standard input, read as a whole, also in the place of an operand.
 #pragma once
 
 #include <cstddef>
@@ -14,5 +14,13 @@ struct Input {
 
 /// Reads up to the end, but no more than `sizeMax` bytes: more is an error.
 [[nodiscard]] Input ReadStandardInput(std::size_t sizeMax);
+
+enum class LastLineFeed : bool { kKept, kDropped };
+
+/// The operand, or, when it is "-", what standard input holds in its place. What is typed or echoed
+/// ends in a line feed that nobody means: one of them may be dropped.
+[[nodiscard]] Input ReadOperand(const std::string& operand,
+                                std::size_t sizeMax,
+                                LastLineFeed lineFeed);
 
 }  // namespace lfhelper

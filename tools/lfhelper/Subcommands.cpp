@@ -4,18 +4,20 @@
 
 #include <algorithm>
 #include <array>
-#include <charconv>
 #include <optional>
-#include <system_error>
 #include <vector>
 
 #include "Helper/Shared/Server/MessageLayouts.h"
-#include "tools/lfhelper/HeartbeatCommands.h"
+#include "tools/lfhelper/DoctorCommand.h"
 #include "tools/lfhelper/FileCommands.h"
+#include "tools/lfhelper/HeartbeatCommands.h"
 #include "tools/lfhelper/HexDump.h"
 #include "tools/lfhelper/LocationCommands.h"
+#include "tools/lfhelper/ParseNumber.h"
 #include "tools/lfhelper/PreferenceCommands.h"
+#include "tools/lfhelper/RadioCommands.h"
 #include "tools/lfhelper/UpdateCommands.h"
+#include "tools/lfhelper/VoicemailCommands.h"
 
 namespace lfhelper {
 namespace {
@@ -58,19 +60,6 @@ Preparation PrepareRemovePreferenceDomain(const CommandLine& line) {
         answer.fields.add("domain", domain);
         return answer;
     }};
-}
-
-/// A decimal number, or a hexadecimal one behind 0x.
-template <typename Number>
-std::optional<Number> ParseNumber(std::string_view text) {
-    const bool isHex = text.starts_with("0x") || text.starts_with("0X");
-    const std::string_view digits = isHex ? text.substr(2) : text;
-    Number number{};
-    const char* const end = digits.data() + digits.size();
-    const auto [rest, error] = std::from_chars(digits.data(), end, number, isHex ? 16 : 10);
-    const bool hasSignBehindPrefix = isHex && digits.starts_with('-');
-    return error == std::errc{} && rest == end && !hasSignBehindPrefix ? std::optional(number)
-                                                                       : std::nullopt;
 }
 
 std::vector<std::byte> MakeMessage(const platform::MachMsgHeader& header, ByteSpan body) {
@@ -153,6 +142,30 @@ constexpr auto kSubcommands = std::to_array<Subcommand>({
      0,
      0,
      PrepareCheckIn},
+    {"doctor",
+     "",
+     "check this system and say what keeps the service from its work",
+     "Looks at all that the service needs, and prints a line for each: \"ok\", \"note\" for what "
+     "may\n"
+     "well be so, \"problem\" for what must be mended, with what to do about it. It changes "
+     "nothing "
+     "and\n"
+     "asks the service for nothing but a check-in. As root it sees most; what it cannot see it "
+     "says "
+     "in\n"
+     "a note.\n"
+     "\n"
+     "The exit status is 1 when there is a problem. With --json, \"checks\" holds an object for "
+     "each\n"
+     "line: \"check\", \"level\", \"finding\", and \"remedy\", which is null where there is "
+     "nothing to do.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper doctor\n"
+     "  lfhelper doctor --group linefold-telephony --json\n",
+     0,
+     0,
+     PrepareDoctor},
     {"link-carrier-bundle",
      "TARGET LINK [DOMAIN]",
      "point a carrier or operator bundle link at a bundle",
@@ -245,33 +258,147 @@ constexpr auto kSubcommands = std::to_array<Subcommand>({
      2,
      2,
      PreparePreferencesRemove},
-    {"update-databases",
-     "[--types TYPES] [--wait] [--timeout SECONDS]",
-     "have the service databases brought up to date",
-     "Has the service compare the installed databases with the server's index, and install what\n"
-     "differs. The service takes the request and sends the outcome to the telephony daemon.\n"
+    {"copy-file",
+     "SOURCE-DIRECTORY DESTINATION-DIRECTORY NAME",
+     "copy a file into a carrier-bundle directory",
+     "Copies SOURCE-DIRECTORY/NAME to DESTINATION-DIRECTORY/NAME, which must be a carrier path, "
+     "and\n"
+     "gives it to the mobile user. The destination directory is made if it is missing.\n"
      "\n"
-     "  --types TYPES      names of gsm, umts, cdma, lte and scdma with commas between them, or "
-     "all\n"
-     "                     (the default), or a mask of their bits, such as 12 or 0xc\n"
-     "  --wait             ask for one type after the other, wait for each outcome in the "
-     "telephony\n"
-     "                     daemon's place, and show it. While the telephony daemon runs this "
-     "cannot\n"
-     "                     be: nothing is asked, and the exit status is 3.\n"
-     "  --timeout SECONDS  wait at most so long in all (default: 300)\n"
-     "\n"
-     "With --wait the exit status is 0 when each type was updated or needed no update, and 1 when\n"
-     "one failed or the time was over; then too the outcomes that came are shown. A type whose\n"
-     "entry in the index has no URL has no outcome at all.\n"
+     "When the service did not do it the exit status is 1; its log tells why.\n"
      "\n"
      "Examples:\n"
-     "  lfhelper update-databases --types gsm,lte\n"
-     "  lfhelper update-databases --wait --timeout 60\n"
-     "  lfhelper update-databases --types gsm --wait --json\n",
+     "  lfhelper copy-file /tmp '/private/var/mobile/Library/Carrier Bundles' Example.plist\n",
+     3,
+     3,
+     PrepareCopyFile},
+    {"move-directory",
+     "SOURCE DESTINATION-DIRECTORY NAME",
+     "move a directory into a carrier-bundle directory",
+     "Moves SOURCE to DESTINATION-DIRECTORY/NAME, which must be a carrier path where nothing is. "
+     "The\n"
+     "destination directory is made if it is missing, also when the path is refused.\n"
+     "\n"
+     "When the service did not do it the exit status is 1; its log tells why.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper move-directory /private/var/tmp/Example.bundle \\\n"
+     "      '/private/var/mobile/Library/Carrier Bundles' Example.bundle\n",
+     3,
+     3,
+     PrepareMoveDirectory},
+    {"copy-log-directory",
+     "SOURCE",
+     "copy logs into the crash-report folder",
+     "Copies a file or directory into Library/Logs/CrashReporter of the mobile user.\n"
+     "\n"
+     "When the service did not do it the exit status is 1; its log tells why.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper copy-log-directory /private/var/tmp/baseband-logs\n",
+     1,
+     1,
+     PrepareCopyLogDirectory},
+    {"copy-archive",
+     "SOURCE DESTINATION",
+     "expand a ZIP archive, or copy anything else",
+     "Expands SOURCE into the directory DESTINATION if its first bytes are those of a ZIP "
+     "archive;\n"
+     "otherwise copies it: what a directory contains goes into DESTINATION, a file to DESTINATION "
+     "or\n"
+     "inside it. A directory DESTINATION is made if it is missing.\n"
+     "\n"
+     "Files that the service had to leave out are told in its log and change nothing else. When "
+     "it\n"
+     "had to stop, what was made until then stays, and the exit status is 1; its log tells why.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper copy-archive /tmp/Example.crbn /private/var/tmp/Example\n",
+     2,
+     2,
+     PrepareCopyArchive},
+    {"load-plist",
+     "PATH",
+     "show a property-list file",
+     "Writes the dictionary in the file PATH to standard output, as an XML property list. With "
+     "--json\n"
+     "it stands in \"plist\".\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper load-plist '/private/var/mobile/Library/Carrier Bundle.bundle/Info.plist'\n",
+     1,
+     1,
+     PrepareLoadPlist},
+    {"voicemail set-token",
+     "[--key KEY] TOKEN",
+     "store a voicemail token",
+     "Stores the access token, or one under a key, in place of an earlier one: a text in UTF-8 of "
+     "at\n"
+     "most 256 bytes. When TOKEN is -, standard input holds it, without the line feed at its end. "
+     "A\n"
+     "token is a secret: other users can see the arguments of a process, but not its input.\n"
+     "\n"
+     "  --key KEY    store it under this key, also a text of at most 256 bytes\n"
+     "\n"
+     "A token of 256 bytes is stored but cannot be read by \"voicemail get-token\". The service\n"
+     "answers success also when it could not write its store: its log tells.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper voicemail set-token - <token-file\n"
+     "  lfhelper voicemail set-token --key +15550100 - <token-file\n",
+     1,
+     1,
+     PrepareVoicemailSetToken},
+    {"voicemail get-token",
+     "[--key KEY]",
+     "show a voicemail token",
+     "Shows the access token, or the one under a key. That there is none, or one of 256 bytes, "
+     "which "
+     "no\n"
+     "reply holds, is no failure of the service: nothing is printed but a note on standard error, "
+     "and\n"
+     "the exit status is 4. With --json, \"token\" is null then.\n"
+     "\n"
+     "  --key KEY    show the token under this key\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper voicemail get-token\n"
+     "  lfhelper voicemail get-token --key +15550100\n",
      0,
      0,
-     PrepareUpdateDatabases},
+     PrepareVoicemailGetToken},
+    {"voicemail clear-token",
+     "",
+     "forget the voicemail token, and no token under a key",
+     "Forgets the access token; that there is none is a success too. Tokens under keys stay.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper voicemail clear-token\n",
+     0,
+     0,
+     PrepareVoicemailClearToken},
+    {"voicemail remove-all",
+     "",
+     "forget all voicemail tokens",
+     "Forgets the access token and the tokens under all keys.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper voicemail remove-all\n",
+     0,
+     0,
+     PrepareVoicemailRemoveAll},
+    {"voicemail is-subscribed",
+     "",
+     "ask whether the subscriber uses visual voicemail",
+     "Shows \"subscribed\" or \"not subscribed\", which is the answer too where the system has no\n"
+     "visual voicemail. The exit status is 0 in both cases.\n"
+     "\n"
+     "Examples:\n"
+     "  lfhelper voicemail is-subscribed\n"
+     "  lfhelper --json voicemail is-subscribed\n",
+     0,
+     0,
+     PrepareVoicemailIsSubscribed},
     {"country-code",
      "",
      "show the country code that is configured",
@@ -343,77 +470,46 @@ constexpr auto kSubcommands = std::to_array<Subcommand>({
      1,
      1,
      PrepareHeartbeat},
-    {"copy-file",
-     "SOURCE-DIRECTORY DESTINATION-DIRECTORY NAME",
-     "copy a file into a carrier-bundle directory",
-     "Copies SOURCE-DIRECTORY/NAME to DESTINATION-DIRECTORY/NAME, which must be a carrier path, "
-     "and\n"
-     "gives it to the mobile user. The destination directory is made if it is missing.\n"
-     "\n"
-     "When the service did not do it the exit status is 1; its log tells why.\n"
+    {"radio-logging",
+     "on|off|N",
+     "switch the logging of the radio manager",
+     "Has the radio manager log everything (on) or errors alone (off). A number is sent as it is:\n"
+     "0 switches off, any other on. The service answers success also where no radio manager runs.\n"
      "\n"
      "Examples:\n"
-     "  lfhelper copy-file /tmp '/private/var/mobile/Library/Carrier Bundles' Example.plist\n",
-     3,
-     3,
-     PrepareCopyFile},
-    {"copy-log-directory",
-     "SOURCE",
-     "copy logs into the crash-report folder",
-     "Copies a file or directory into Library/Logs/CrashReporter of the mobile user.\n"
-     "\n"
-     "When the service did not do it the exit status is 1; its log tells why.\n"
-     "\n"
-     "Examples:\n"
-     "  lfhelper copy-log-directory /private/var/tmp/baseband-logs\n",
+     "  lfhelper radio-logging on\n"
+     "  lfhelper radio-logging 0\n",
      1,
      1,
-     PrepareCopyLogDirectory},
-    {"move-directory",
-     "SOURCE DESTINATION-DIRECTORY NAME",
-     "move a directory into a carrier-bundle directory",
-     "Moves SOURCE to DESTINATION-DIRECTORY/NAME, which must be a carrier path where nothing is. "
-     "The\n"
-     "destination directory is made if it is missing, also when the path is refused.\n"
+     PrepareRadioLogging},
+    {"update-databases",
+     "[--types TYPES] [--wait] [--timeout SECONDS]",
+     "have the service databases brought up to date",
+     "Has the service compare the installed databases with the server's index, and install what\n"
+     "differs. The service takes the request and sends the outcome to the telephony daemon.\n"
      "\n"
-     "When the service did not do it the exit status is 1; its log tells why.\n"
+     "  --types TYPES      names of gsm, umts, cdma, lte and scdma with commas between them, or "
+     "all\n"
+     "                     (the default), or a mask of their bits, such as 12 or 0xc\n"
+     "  --wait             ask for one type after the other, wait for each outcome in the "
+     "telephony\n"
+     "                     daemon's place, and show it. While the telephony daemon runs this "
+     "cannot\n"
+     "                     be: nothing is asked, and the exit status is 3.\n"
+     "  --timeout SECONDS  wait at most so long in all (default: 300)\n"
      "\n"
-     "Examples:\n"
-     "  lfhelper move-directory /private/var/tmp/Example.bundle \\\n"
-     "      '/private/var/mobile/Library/Carrier Bundles' Example.bundle\n",
-     3,
-     3,
-     PrepareMoveDirectory},
-    {"copy-archive",
-     "SOURCE DESTINATION",
-     "expand a ZIP archive, or copy anything else",
-     "Expands SOURCE into the directory DESTINATION if its first bytes are those of a ZIP "
-     "archive;\n"
-     "otherwise copies it: what a directory contains goes into DESTINATION, a file to DESTINATION "
-     "or\n"
-     "inside it. A directory DESTINATION is made if it is missing.\n"
-     "\n"
-     "Files that the service had to leave out are told in its log and change nothing else. When "
-     "it\n"
-     "had to stop, what was made until then stays, and the exit status is 1; its log tells why.\n"
+     "With --wait the exit status is 0 when each type was updated or needed no update, and 1 when\n"
+     "one failed or the time was over; then too the outcomes that came are shown. A type whose\n"
+     "entry in the index has no URL has no outcome at all. A failure, or that nothing was to be\n"
+     "done, may be the end of a request that was made before: they name no type.\n"
      "\n"
      "Examples:\n"
-     "  lfhelper copy-archive /tmp/Example.crbn /private/var/tmp/Example\n",
-     2,
-     2,
-     PrepareCopyArchive},
-    {"load-plist",
-     "PATH",
-     "show a property-list file",
-     "Writes the dictionary in the file PATH to standard output, as an XML property list. With "
-     "--json\n"
-     "it stands in \"plist\".\n"
-     "\n"
-     "Examples:\n"
-     "  lfhelper load-plist '/private/var/mobile/Library/Carrier Bundle.bundle/Info.plist'\n",
-     1,
-     1,
-     PrepareLoadPlist},
+     "  lfhelper update-databases --types gsm,lte\n"
+     "  lfhelper update-databases --wait --timeout 60\n"
+     "  lfhelper update-databases --types gsm --wait --json\n",
+     0,
+     0,
+     PrepareUpdateDatabases},
     {"raw",
      "[--complex] [--claim-size N] ID [HEX]",
      "send a message as it is, and show the reply field by field",

@@ -34,11 +34,21 @@ struct Answer {
 
 using Request = std::function<Answer(LFMobileHelper* helper)>;
 
-/// What a command makes of its operands before anything is connected.
+/// What a command that looks for itself, without a request, has seen.
+struct Report {
+    bool isWell = true;
+    /// For people, ending in a newline.
+    std::string text{};
+    /// For programs.
+    JsonObject fields{};
+};
+
+/// What a command makes of its operands before anything is connected: one of these.
 struct Preparation {
     Request request{};
-    /// What is wrong with the operands; `request` is empty then.
+    /// What is wrong with the operands.
     std::string error{};
+    std::function<Report()> look{};
 };
 
 struct Subcommand {

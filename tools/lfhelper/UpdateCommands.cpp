@@ -93,13 +93,21 @@ std::vector<Check> ChecksOf(std::uint32_t mask) {
     return checks;
 }
 
-/// What the service says of a check, without the prefix that all have; none when the message is no
-/// notification.
-std::optional<std::string> OutcomeIn(const tools::PortMessage& message) {
+const std::string* TextIn(const platform::PropertyList& list, std::string_view key) {
+    const auto* const value = list.find(key);
+    return value == nullptr ? nullptr : value->as<std::string>();
+}
+
+/// What the service says of a check for one type, without the prefix that all have; none when the
+/// message is no notification, or one of another type that somebody had asked for before.
+std::optional<std::string> OutcomeIn(const tools::PortMessage& message, std::string_view type) {
     const auto list = platform::PropertyListCreateWithData(message.body);
-    const auto* const value = list ? list->find("Notification") : nullptr;
-    const auto* const text = value == nullptr ? nullptr : value->as<std::string>();
+    const auto* const text = list ? TextIn(*list, "Notification") : nullptr;
     if (message.id != 0 || text == nullptr || !text->starts_with(kNotificationPrefix)) {
+        return std::nullopt;
+    }
+    const auto* const toldType = TextIn(*list, "DBType");
+    if (toldType != nullptr && *toldType != type) {
         return std::nullopt;
     }
     return text->substr(kNotificationPrefix.size());
@@ -135,7 +143,7 @@ public:
 
     /// Asks for the next type, or ends the command with a success or the refusal of the service.
     std::optional<Answer> take(const tools::PortMessage& message) {
-        auto outcome = OutcomeIn(message);
+        auto outcome = OutcomeIn(message, checks_.at(outcomes_.size()).name);
         if (!outcome) {
             return std::nullopt;
         }

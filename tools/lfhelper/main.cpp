@@ -67,8 +67,9 @@ void PrintHelp() {
         "  --help          print this text, or that of a command\n"
         "  --version       print the version\n"
         "\n"
-        "Exit status: 0 success; 1 the service refused or failed; 2 wrong usage;\n"
-        "3 no service, not entitled, or the group cannot be taken; 4 there is no such value.\n"
+        "Exit status: 0 success; 1 the service refused or failed, or doctor found a problem;\n"
+        "2 wrong usage; 3 no service, not entitled, or the group cannot be taken; 4 there is no\n"
+        "such value.\n"
         "\n"
         "Examples:\n"
         "  lfhelper check-in\n"
@@ -183,6 +184,21 @@ int Call(const CommandLine& line, const Subcommand& subcommand, const Request& r
     return ExitStatusOf(answer);
 }
 
+int Look(const CommandLine& line, const std::function<Report()>& look) {
+    const Report report = look();
+    const ExitStatus status = report.isWell ? kSuccess : kFailure;
+    if (line.has("json")) {
+        JsonObject object;
+        object.add("command", line.command);
+        object.add("exitStatus", std::int64_t{status});
+        object.append(report.fields);
+        Print(stdout, object.toString() + "\n");
+    } else {
+        Print(stdout, report.text);
+    }
+    return status;
+}
+
 int RunSubcommand(const CommandLine& line, const Subcommand& subcommand) {
     if (line.operands.size() < subcommand.operandsMin) {
         return Fail(line, kUsage, "USAGE", "too few arguments for " + line.command);
@@ -191,6 +207,9 @@ int RunSubcommand(const CommandLine& line, const Subcommand& subcommand) {
         return Fail(line, kUsage, "USAGE", "too many arguments for " + line.command);
     }
     const Preparation preparation = subcommand.prepare(line);
+    if (preparation.look) {
+        return Look(line, preparation.look);
+    }
     return preparation.error.empty() ? Call(line, subcommand, preparation.request)
                                      : Fail(line, kUsage, "USAGE", preparation.error);
 }

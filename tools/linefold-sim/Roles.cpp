@@ -4,6 +4,7 @@
 
 #include "tools/linefold-sim/ConfigurationServer.h"
 #include "tools/linefold-sim/Geocoder.h"
+#include "tools/linefold-sim/ModemManager.h"
 #include "tools/linefold-sim/Stun.h"
 #include "tools/linefold-sim/Telephony.h"
 
@@ -19,6 +20,10 @@ std::span<const Role> Roles() {
          .summary = "tell the address of a place, by HTTP",
          .help = kGeocoderHelp,
          .play = &PlayGeocoder},
+        {.name = "modem-manager",
+         .summary = "own the modem manager's name on the bus and print what is asked",
+         .help = kModemManagerHelp,
+         .play = &PlayModemManager},
         {.name = "stun",
          .summary = "tell who asks under which address he is seen",
          .help = kStunHelp,

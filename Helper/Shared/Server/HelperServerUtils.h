@@ -49,8 +49,8 @@ platform::RunLoopResult MobileHelperServerRun(MobileHelperServer* server);
 /// From any thread. Returns 0.
 int MobileHelperServerStop(MobileHelperServer* server);
 
-/// Removes all clients and retires the record, whose memory stays: queues may still release holds on
-/// it. The idle timer is left: the process ends right after.
+/// Removes all clients and retires the record, whose memory stays: queues may still release holds
+/// on it. The idle timer is left: the process ends right after.
 void MobileHelperServerDestroy(MobileHelperServer* server);
 
 /// Keeps the process alive until the token is released; cancels a pending idle exit. From any
