@@ -187,6 +187,43 @@ the_heartbeat_is_switched() {
     json '.exitStatus == 2 and .name == "USAGE"'
 }
 
+files_are_put_into_place() {
+    local bundles="$library/Carrier Bundles"
+    mkdir -p /tmp/sent "$library/Logs/CrashReporter"
+    plist '<dict/>' >/tmp/sent/Info.plist
+    exits 0 copy-file /tmp/sent "$bundles/a.bundle" Info.plist
+    prints 'copy-file: success'
+    expect 'the owner of the copy' mobile "$(stat -c %U "$bundles/a.bundle/Info.plist")"
+    exits 0 copy-log-directory /tmp/sent
+    [ -f "$library/Logs/CrashReporter/sent/Info.plist" ] || fail "$what: no copy"
+    exits 0 --json copy-archive /tmp/sent /tmp/copied
+    json '.done and .code == 0 and .destination == "/tmp/copied"'
+    exits 0 move-directory /tmp/copied "$bundles" b.bundle
+    cmp -s /tmp/sent/Info.plist "$bundles/b.bundle/Info.plist" || fail "$what: not moved"
+}
+
+files_that_cannot_be_put_into_place_are_told() {
+    exits 1 copy-file /tmp/sent /tmp/elsewhere Info.plist
+    says 'the service did not copy Info.plist from /tmp/sent to /tmp/elsewhere'
+    silent out
+    exits 1 --json move-directory /tmp/sent /tmp/elsewhere x
+    json '.done == false and .name == "NOT_DONE" and .exitStatus == 1'
+    printf 'PK\3\4' >/tmp/torn
+    exits 1 copy-archive /tmp/torn /tmp/expanded
+    says 'its log tells why'
+    exits 1 copy-log-directory /nowhere
+}
+
+property_list_files_are_shown() {
+    exits 0 load-plist /tmp/sent/Info.plist
+    prints "$(plist '<dict/>')"
+    exits 0 --json load-plist /tmp/sent/Info.plist
+    json '(.plist | contains("<dict/>")) and .path == "/tmp/sent/Info.plist"'
+    exits 1 load-plist /nowhere
+    says '9 NO_DATA'
+    silent out
+}
+
 raw_messages_are_answered() {
     exits 1 raw 12345
     grep -q 'return code: -303 BAD_ID' /tmp/out || fail "$what: no return code"
@@ -217,6 +254,9 @@ carrier_bundles_are_linked
 symbolic_links_are_made
 preference_domains_are_removed
 the_heartbeat_is_switched
+files_are_put_into_place
+files_that_cannot_be_put_into_place_are_told
+property_list_files_are_shown
 raw_messages_are_answered
 only_the_entitled_are_served
 finish "lfhelper and the daemon agree"
