@@ -21,9 +21,8 @@ struct FileStatus {
 /// The daemon is root and works below folders that the mobile user owns. On the way a symbolic link
 /// is followed if root owns it, or if it leads to something that the link's own owner owns;
 /// otherwise EPERM. ".." is taken as it stands. A resolution that failed is answered by every
-/// operation with its error. All operations return 0 or an errno value, and
-/// only stat, realPath and read follow a link in the last step. A path that ends in a slash names
-/// what must be a directory: ENOTDIR for anything else.
+/// operation with its error. All operations return 0 or an errno value, and none but stat, realPath
+/// and read follows a link in the last step. A path that ends in a slash names a directory.
 class PathAccess {
 public:
     explicit PathAccess(std::string_view path);

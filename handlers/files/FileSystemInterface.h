@@ -12,9 +12,13 @@
 
 #include "platform/PropertyList.h"
 
-/// Paths are UTF-8 texts. Results are mixed on purpose, and told with each operation: 0 for
-/// success, otherwise an errno value, a failure code of the file manager (an errno value, too), -1
-/// from a failed stat, or 5 where there was no such code. The order of the operations is binding.
+/// Paths are UTF-8 texts. Results are mixed on purpose, and told with each operation, since callers
+/// test them as they are: 0 for success, otherwise an errno value, a failure code of the file
+/// manager (an errno value, too, and never absent), -1 from a failed POSIX call, or 5 where nothing
+/// was there to work on. The order of the operations is binding.
+///
+/// Links that strangers own lead nowhere, and below a folder that is worked on no link is followed:
+/// platform/PathAccess.h and platform/DirectoryAccess.h have the rules.
 class FileSystemInterface {
 public:
     enum class Recursive : bool { kNo, kYes };
@@ -28,8 +32,10 @@ public:
     /// moveItemWithOwner with the process's own uid and gid.
     virtual int moveItem(const char* source, const char* destination) = 0;
 
-    /// Moves an item, into the destination if that is a directory, merging with what is there.
-    /// 0, -1 (no such source), 17 (a directory onto a file), or a failure code.
+    /// Gives the source to the owner and moves it: to the path if nothing is there, else in the
+    /// place of the file there, else into the directory there under its own name. Trees that meet
+    /// are merged item by item, and what of them could not be merged is not told. 0, -1 (no such
+    /// source), 17 (a directory onto a file), or, where nothing was, a failure code.
     virtual int moveItemWithOwner(const char* source,
                                   const char* destination,
                                   std::uint32_t uid,
@@ -39,7 +45,8 @@ public:
     /// is. 0, -1 (no such source), or a failure code.
     virtual int moveFile(const char* source, const char* destination) = 0;
 
-    /// The same as moveItem, but copies.
+    /// The same as moveItem, but copies; the source is given to the process all the same. What is
+    /// in the way is removed first, so a file that is copied onto itself is lost.
     virtual int copyItem(const char* source, const char* destination) = 0;
 
     /// Copies source directory/name to destination directory/name, and makes the destination
@@ -48,7 +55,9 @@ public:
                               std::string_view destinationDirectory,
                               std::string_view name) = 0;
 
-    /// 0 or a failure code; recursive: 5 when there is nothing at the path.
+    /// Of the item alone: 0 or -1. Recursive, with all that lies below it: 0, 5 when there is
+    /// nothing at the path, the item's own failure code, or the last one below it. Links are never
+    /// followed to what they lead to.
     virtual int setPermissions(const char* path, std::uint32_t mode, Recursive recursive) = 0;
     virtual int setOwner(const char* path,
                          std::uint32_t uid,
@@ -60,7 +69,8 @@ public:
                                 std::uint32_t mode,
                                 Intermediates intermediates) = 0;
 
-    /// The same; names that are empty set no owner and no group.
+    /// The same; names that are empty set no owner and no group, and one that nobody knows is
+    /// EINVAL.
     virtual int createDirectoryWithOwner(std::string_view path,
                                          std::uint32_t mode,
                                          std::string_view ownerName,

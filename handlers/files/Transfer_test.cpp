@@ -197,6 +197,12 @@ TEST_F(TransferTest, MergesAcrossFileSystems) {
     EXPECT_EQ(sim::FileAt("/to/tree/file")->owner, 0U);
 }
 
+TEST_F(TransferTest, RemovesWhatIsInTheWayEvenIfItIsTheSource) {
+    file("/from/file");
+    EXPECT_EQ(copy("/from/file", "/from/file"), 0);
+    EXPECT_FALSE(isAt("/from/file"));
+}
+
 TEST_F(TransferTest, GoesNowhereByAStrangersLink) {
     sim::MakeDirectory("/roots");
     sim::MakeLink("/to/link", "/roots", kMobile);

@@ -20,5 +20,13 @@ TEST(UserDatabase, KnowsNothingOfAnUnknownUser) {
     }
 }
 
+TEST(UserDatabase, KnowsGroups) {
+    EXPECT_EQ(GroupIdByName("mobile"), 501U);
+    EXPECT_EQ(GroupIdByName("root"), 0U);
+    for (const char* name : {"", "no-such-group", "501"}) {
+        EXPECT_FALSE(GroupIdByName(name).has_value()) << name;
+    }
+}
+
 }  // namespace
 }  // namespace platform

@@ -83,6 +83,18 @@ TEST_F(FileManagerContract, CopiesKeepTimesAndUserAttributes) {
     EXPECT_EQ(item("copy/file").attributes, attributes);
 }
 
+TEST_F(FileManagerContract, CopiesKeepManyUserAttributes) {
+    twin::Item many;
+    for (int i = 0; i < 30; ++i) {
+        many.attributes["user.attribute-" + std::to_string(i)] = std::to_string(i);
+    }
+    many.attributes["user.large"] = std::string(1500, 'x');
+    many.attributes["user.empty"] = "";
+    twin::Put(at("source"), many);
+    ASSERT_EQ(copy("source", "copy"), 0);
+    EXPECT_EQ(item("copy").attributes, many.attributes);
+}
+
 TEST_F(FileManagerContract, CopiesLoseSetIdBits) {
     folder("source", 07777);
     file("source/file", "", 06755);
