@@ -23,6 +23,8 @@ protected:
     }
 
     ~Updater() override {
+        updater = nullptr;
+        sim::Settle();  // it ends on its queue
         EXPECT_EQ(server->holdMask, 0U) << "every hold was released";
         MobileHelperServerDestroy(server);
     }
@@ -68,7 +70,7 @@ protected:
     }
 
     MobileHelperServer* server = nullptr;
-    const std::shared_ptr<LASDUpdater> updater = LASDUpdater::create();
+    std::shared_ptr<LASDUpdater> updater = LASDUpdater::create();
 };
 
 TEST_F(Updater, InstallsWhatIsNewerWithGsmFirst) {

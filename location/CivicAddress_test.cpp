@@ -3,7 +3,7 @@
 #include <cmath>
 #include <limits>
 
-#include "location/LocationTest.h"
+#include "location/Location_test.h"
 
 using platform::LogLevel;
 using platform::ORBAddress;

@@ -1,6 +1,6 @@
 #include "location/CountryCode.h"
 
-#include "location/LocationTest.h"
+#include "location/Location_test.h"
 
 namespace {
 

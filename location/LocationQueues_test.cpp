@@ -1,6 +1,6 @@
 #include "location/LocationQueues.h"
 
-#include "location/LocationTest.h"
+#include "location/Location_test.h"
 #include "platform/RunLoop.h"
 
 using platform::LogLevel;

@@ -3,7 +3,7 @@
 #include <atomic>
 #include <thread>
 
-#include "location/LocationTest.h"
+#include "location/Location_test.h"
 
 namespace {
 

@@ -2,7 +2,7 @@
 
 #include <cerrno>
 
-#include "location/LocationTest.h"
+#include "location/Location_test.h"
 
 using platform::LogLevel;
 

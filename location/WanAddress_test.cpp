@@ -1,6 +1,6 @@
 #include "location/WanAddress.h"
 
-#include "location/LocationTest.h"
+#include "location/Location_test.h"
 
 using platform::LogLevel;
 using platform::ORBError;

@@ -10,7 +10,8 @@
 namespace hvu::Compression {
 namespace {
 
-/// Measured with databases of 100 MB: a quarter of this costs 5 % more, and twice as much gains nothing.
+/// Measured with databases of 100 MB: a quarter of this costs 5 % more, and twice as much gains
+/// nothing.
 constexpr std::size_t kBufferSize = 512UL * 1024;
 
 constexpr int kGzipWindow = 15 + 16;  // the largest window, and gzip alone

@@ -38,7 +38,7 @@ using Owned = std::unique_ptr<T, Deleter>;
 struct Transfer {
     const LinefoldHttpRequest& request;
     LinefoldHttpResult& result;
-    std::string location{};  ///< of the header that came last
+    std::string location{};      ///< of the header that came last
     bool isHeaderWhole = false;  ///< its empty line has come
     bool hasBody = false;
     bool isRedirectBody = false;  ///< its answer was ended where its body began

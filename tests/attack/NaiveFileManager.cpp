@@ -36,7 +36,9 @@ int Guarded(const Work& work) {
 
 }  // namespace
 
-int FileManagerCopyItem(const PathAccess& source, const PathAccess& destination) {
+int FileManagerCopyItem(const PathAccess& source,
+                        const PathAccess& destination,
+                        const LeaveOutHandler& /*leavesOut*/) {
     const int refusal = JudgeBoth(source, destination);
     return refusal != 0 ? refusal : Guarded([&] {
         if (fs::exists(fs::symlink_status(PathOf(destination)))) {

@@ -65,4 +65,13 @@ usage 'nowhere is no address' stun --claim nowhere
 usage 'cannot use --error 200' stun --error 200
 usage 'cannot use --status 99' geocoder --status 99
 
+expect 0 modem-manager --help
+says out 'Usage: linefold-sim modem-manager'
+says out 'Example'
+usage 'linefold-sim modem-manager: there is no option --nonsense' modem-manager --nonsense
+usage 'linefold-sim modem-manager: the option --bus needs a value' modem-manager --bus
+expect 1 modem-manager --bus "$folder/no-bus"
+says err 'there is no bus at'
+silent out
+
 [ "$failures" -eq 0 ] || exit 1

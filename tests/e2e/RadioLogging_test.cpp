@@ -68,7 +68,10 @@ std::vector<std::string> Recorded() {
 
 /// For when requests from before the modem manager came may or may not have reached it.
 bool EventuallyEndsIn(const std::string& level) {
-    return phone::Eventually([&level] { return Recorded().back() == level; });
+    return phone::Eventually([&level] {
+        const auto lines = Recorded();
+        return !lines.empty() && lines.back() == level;
+    });
 }
 
 /// A bus as a system has it, but for its rules: everybody may do everything.
@@ -98,13 +101,17 @@ private:
 
 class ModemManager {
 public:
-    explicit ModemManager(const std::string& socket = kSocket)
-        : program_({phone::ProgramPath("linefold-sim"), "modem-manager", "--bus", socket},
-                   kRecord) {
+    explicit ModemManager(const std::string& socket = kSocket) : program_(words(socket), kRecord) {
         EXPECT_TRUE(phone::Eventually([] { return !Recorded().empty(); }));
     }
 
 private:
+    /// What an earlier one wrote down would be taken for this one's.
+    static std::vector<std::string> words(const std::string& socket) {
+        fs::remove(kRecord);
+        return {phone::ProgramPath("linefold-sim"), "modem-manager", "--bus", socket};
+    }
+
     Program program_;
 };
 

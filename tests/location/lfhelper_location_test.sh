@@ -165,6 +165,28 @@ prints 'address: '
 line /run/log/journal '3 LinefoldMobileHelper - _RequestWanIPFromLocation error: (the STUN server refused with error 438)'
 ends "$player"
 
+# ---- A geocoder behind HTTPS, trusted and not
+mkdir /tmp/www
+echo '{"address":{"town":"Ely","country_code":"gb"}}' >/tmp/www/reverse
+configure CountryCode US ReverseGeocodeURL https://configuration.vendra.example/reverse
+serves_https() { # CERTIFICATE
+    "$programs/linefold-sim" configuration-server --certificate "$1" /tmp/www >/tmp/https 2>&1 &
+    player=$!
+    for _ in {1..1000}; do
+        [ -s /tmp/https ] && return
+        sleep 0.01
+    done
+    fail "no configuration server"
+}
+serves_https trusted
+exits 0 --json civic-address --wait 52.4 0.26
+json '.countryCode == "GB" and .city == "Ely" and .state == ""'
+ends "$player"
+serves_https self-signed
+exits 0 --json civic-address --wait 52.4 0.26
+json '.countryCode == "US" and .city == ""'
+ends "$player"
+
 # ---- The database updater's notifications, and what is none
 plays telephony telephony --only lasd
 perl -e '

@@ -13,7 +13,8 @@ enum class Flaw : unsigned char { kNone, kExpired, kOtherHost, kSelfSigned, kUnk
 class CertificateAuthority {
 public:
     /// Makes keys and certificates for a host in a folder, and adds the authority to the bundle,
-    /// unless the flaw is that nobody knows who signed. None when that fails; what to mend was said.
+    /// unless the flaw is that nobody knows who signed. None when that fails; what to mend was
+    /// said.
     [[nodiscard]] static std::optional<CertificateAuthority> create(std::string folder,
                                                                     std::string_view host,
                                                                     Flaw flaw);

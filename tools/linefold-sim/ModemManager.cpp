@@ -10,12 +10,14 @@
 #include <cstdint>
 #include <cstdio>
 #include <memory>
-#include <optional>
 #include <string>
+
+#include "tools/linefold-sim/RoleOptions.h"
 
 namespace simulator {
 namespace {
 
+constexpr std::string_view kRole = "modem-manager";
 constexpr const char* kSystemBus = "/run/dbus/system_bus_socket";
 constexpr const char* kName = "org.freedesktop.ModemManager1";
 constexpr const char* kObject = "/org/freedesktop/ModemManager1";
@@ -72,28 +74,20 @@ void Serve(sd_bus* bus) {
     }
 }
 
-std::optional<std::string> PathOfBus(std::span<const std::string_view> words) {
-    if (words.empty()) {
-        return kSystemBus;
-    }
-    return words.size() == 2 && words[0] == "--bus" ? std::optional(std::string(words[1]))
-                                                    : std::nullopt;
-}
-
 }  // namespace
 
 int PlayModemManager(std::span<const std::string_view> words) {
-    const auto path = PathOfBus(words);
-    if (!path) {
-        (void)std::fputs("linefold-sim: usage: linefold-sim modem-manager [--bus PATH]\n", stderr);
-        return 2;
+    constexpr std::array<KnownOption, 1> kKnown{{{"--bus"}}};
+    const auto options = RoleOptions::parse(kRole, words, kKnown);
+    if (!options) {
+        return kUsage;
     }
+    const std::string path = options->value("--bus", kSystemBus);
     sd_bus* made = nullptr;
     const bool isMade = sd_bus_new(&made) >= 0;
     const std::unique_ptr<sd_bus, CloseBus> bus(made);
-    if (!isMade || !Appear(bus.get(), *path)) {
-        (void)std::fprintf(stderr, "linefold-sim: there is no bus at %s\n", path->c_str());
-        return 1;
+    if (!isMade || !Appear(bus.get(), path)) {
+        return Complain(kRole, "there is no bus at " + path + " that takes a modem manager");
     }
     (void)std::puts("ready");
     Serve(bus.get());

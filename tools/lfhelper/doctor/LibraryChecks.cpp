@@ -25,7 +25,11 @@ constexpr std::array kLibraries{
     Library{"http-module",
             "libLinefoldHttp.so",
             Origin::kOurs,
-            "service databases and civic addresses cannot be fetched"},
+            "neither service databases nor civic addresses can be fetched"},
+    Library{"geocoder-module",
+            "libLinefoldGeocoder.so",
+            Origin::kOurs,
+            "civic addresses cannot be looked up"},
     Library{
         "archive-module", "libLinefoldArchive.so", Origin::kOurs, "archives cannot be expanded"},
     Library{"radio-module",
