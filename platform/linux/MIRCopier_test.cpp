@@ -111,52 +111,6 @@ TEST_F(ArchiveCopier, IsNotHurtByHostileArchives) {
     }
 }
 
-std::vector<zip::Entry> Folders(std::size_t count) {
-    std::vector<zip::Entry> entries;
-    for (std::size_t i = 0; i < count; ++i) {
-        entries.push_back(zip::Folder(std::to_string(i)));
-    }
-    return entries;
-}
-
-std::size_t CountIn(const std::string& folder) {
-    return static_cast<std::size_t>(
-        std::distance(fs::directory_iterator(folder), fs::directory_iterator()));
-}
-
-TEST_F(ArchiveCopier, EndsAtTheFirstEntryBeyondThat) {
-    EXPECT_EQ(expand(zip::Write(Folders(100'001))), EFBIG);
-    EXPECT_EQ(calls, Lines{"fatal 27"});
-    EXPECT_EQ(CountIn(kDestination), 100'000U) << "what was expanded stays";
-}
-
-TEST_F(ArchiveCopier, CountsTheFoldersThatNamesImply) {
-    std::vector<zip::Entry> entries;
-    for (int i = 0; i < 1'700; ++i) {
-        std::string name = std::to_string(i);
-        for (int depth = 0; depth < 63; ++depth) {
-            name += "/d";
-        }
-        entries.push_back(zip::Folder(name));
-    }
-    EXPECT_EQ(expand(zip::Write(std::move(entries))), EFBIG);
-    EXPECT_EQ(calls, Lines{"fatal 27"});
-    EXPECT_EQ(CountIn(kDestination), 1'563U) << "100,000 folders, 64 for each name";
-}
-
-TEST_F(ArchiveCopier, RefusesADirectoryThatMemoryWouldNotHold) {
-    const std::string record = zip::Write(Folders(1)).substr(31, 47);
-    std::string records;
-    for (int i = 0; i < 1'000'000; ++i) {
-        records += record;
-    }
-    zip::Archive archive{.entries = Folders(1)};
-    archive.locator = records;
-    archive.directorySize = static_cast<std::uint32_t>(records.size() + record.size());
-    EXPECT_EQ(expand(zip::Write(archive)), EFBIG);
-    EXPECT_EQ(calls, Lines{"fatal 27"});
-}
-
 TEST_F(ArchiveCopier, LeavesWhatIsInTheDestinationButForFilesOfTheSameName) {
     fs::create_directories(kDestination + "/folder");
     WriteFile(kDestination + "/folder/kept", "kept");

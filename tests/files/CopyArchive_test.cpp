@@ -120,15 +120,57 @@ TEST_F(CopyArchive, IsNotHurtByHostileArchives) {
     EXPECT_LT(peakMemory(), 16U);
 }
 
-TEST_F(CopyArchive, OfManyEntriesTakesBoundedMemory) {
+std::vector<zip::Entry> Folders(std::size_t count) {
     std::vector<zip::Entry> entries;
-    for (int i = 0; i < 100'000; ++i) {
-        entries.push_back(zip::Folder("d" + std::to_string(i)));
+    for (std::size_t i = 0; i < count; ++i) {
+        entries.push_back(zip::Folder(std::to_string(i)));
     }
-    EXPECT_TRUE(expand(zip::Write(std::move(entries))));
-    EXPECT_EQ(std::distance(fs::directory_iterator(kDestination), fs::directory_iterator()),
-              100'000);
+    return entries;
+}
+
+std::ptrdiff_t ItemsIn(const std::string& folder) {
+    return std::distance(fs::directory_iterator(folder), fs::directory_iterator());
+}
+
+TEST_F(CopyArchive, Takes100000Entries) {
+    EXPECT_TRUE(expand(zip::Write(Folders(100'000))));
+    EXPECT_EQ(ItemsIn(kDestination), 100'000);
     EXPECT_LT(peakMemory(), 64U);
+}
+
+TEST_F(CopyArchive, EndsAtTheFirstEntryBeyondThat) {
+    EXPECT_FALSE(expand(zip::Write(Folders(100'001))));
+    EXPECT_EQ(ItemsIn(kDestination), 100'000) << "what was expanded stays";
+    EXPECT_EQ(systemLog_.take(), Lines{kFatalLine});
+    EXPECT_EQ(journal_.take(),
+              Lines{"3 platform archive copier: " + kSource + ": more than 100,000 entries"});
+}
+
+TEST_F(CopyArchive, CountsTheFoldersThatNamesImply) {
+    std::string deep;
+    for (int depth = 0; depth < 63; ++depth) {
+        deep += "/d";
+    }
+    std::vector<zip::Entry> entries = Folders(1'700);
+    for (zip::Entry& entry : entries) {
+        entry.name += deep;
+    }
+    EXPECT_FALSE(expand(zip::Write(std::move(entries))));
+    EXPECT_EQ(ItemsIn(kDestination), 1'563) << "100,000 folders, 64 for each name";
+}
+
+TEST_F(CopyArchive, RefusesADirectoryThatMemoryWouldNotHold) {
+    constexpr std::size_t kHeaderSize = 31;
+    constexpr std::size_t kRecordSize = 47;
+    const std::string record = zip::Write(Folders(1)).substr(kHeaderSize, kRecordSize);
+    zip::Archive archive{.entries = Folders(1)};
+    for (int i = 0; i < 1'000'000; ++i) {
+        archive.locator += record;
+    }
+    archive.directorySize = static_cast<std::uint32_t>(archive.locator.size() + kRecordSize);
+    EXPECT_FALSE(expand(zip::Write(archive)));
+    EXPECT_LT(peakMemory(), 64U);
+    EXPECT_EQ(systemLog_.take(), Lines{kFatalLine});
 }
 
 TEST_F(CopyArchive, TakesSourcesOfEveryKind) {

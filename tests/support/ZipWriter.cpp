@@ -117,8 +117,8 @@ std::string DeflateZeros(std::uint32_t size) {
 
 std::string Number(std::uint64_t value, std::size_t bytes) {
     std::string number;
-    for (std::size_t i = 0; i < bytes; ++i) {
-        number += static_cast<char>(value >> (8 * i));
+    for (; bytes > 0; --bytes, value >>= 8) {
+        number += static_cast<char>(value);
     }
     return number;
 }
