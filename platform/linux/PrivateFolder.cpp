@@ -16,16 +16,19 @@ constexpr mode_t kPermissions = S_IRWXU | S_IRWXG | S_IRWXO;
 }  // namespace
 
 PrivateFolder::~PrivateFolder() {
-    if (file_.isOpen()) {
+    if (isOurs_) {
         (void)unlinkat(parent_, name_.c_str(), AT_REMOVEDIR);
     }
 }
 
 int PrivateFolder::make(int parent, std::string name) {
-    if (mkdirat(parent, name.c_str(), kNobodyElse) != 0 && errno != EEXIST) {
+    parent_ = parent;
+    name_ = std::move(name);
+    isOurs_ = mkdirat(parent, name_.c_str(), kNobodyElse) == 0;
+    if (!isOurs_ && errno != EEXIST) {
         return errno;
     }
-    OwnedFd file(openat(parent, name.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+    OwnedFd file(openat(parent, name_.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
 
     struct stat status {};
 
@@ -36,8 +39,7 @@ int PrivateFolder::make(int parent, std::string name) {
     if (status.st_uid != geteuid() || (status.st_mode & kPermissions) != kNobodyElse) {
         return EEXIST;
     }
-    parent_ = parent;
-    name_ = std::move(name);
+    isOurs_ = true;
     file_ = std::move(file);
     return 0;
 }

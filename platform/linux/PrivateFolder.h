@@ -26,6 +26,7 @@ public:
 private:
     int parent_ = -1;
     std::string name_;
+    bool isOurs_ = false;
     OwnedFd file_;
 };
 

@@ -102,6 +102,7 @@ int StatusOf(std::vector<std::string> command) {
 }
 
 struct Ending {
+    std::string call;  ///< that the fault was to hit
     bool succeeded = false;
     bool wasHit = false;  ///< the operation came as far as the fault
 };
@@ -136,7 +137,8 @@ protected:
                                      kSource,
                                      kCopy});
         const bool isKilled = fault == kKill && status != 0 && status != 1;
-        return {.succeeded = status == 0,
+        return {.call = call,
+                .succeeded = status == 0,
                 .wasHit = isKilled || Contents(kTrace).find("(INJECTED)") != std::string::npos};
     }
 
@@ -175,11 +177,17 @@ TEST_P(FaultyFileOperations, CopyAllOrNothing) {
         if (ending.succeeded) {
             EXPECT_EQ(copy, source);
         }
-        // A process that lives on cleans up after itself; after one that died the next one does.
-        if (fault != kKill) {
+        // A process that lives on cleans up after itself, unless just that fails; after one that
+        // died the next one does.
+        if (fault != kKill && ending.call != "unlinkat") {
             EXPECT_EQ(Names(kTop + "/to").size(), copy.empty() ? 0U : 1U);
         }
         fs::remove_all(kCopy);
+        if (fault != kKill && ending.call == "unlinkat") {
+            EXPECT_TRUE(perform("copy", "openat", fault, 1000).succeeded);
+            EXPECT_EQ(Names(kTop + "/to"), std::vector<std::string>{"copy"}) << "the rest is gone";
+            fs::remove_all(kCopy);
+        }
     });
     EXPECT_GT(faults, 60);
     EXPECT_TRUE(perform("copy", "openat", "error=EIO", 1000).succeeded);
