@@ -18,7 +18,8 @@ bool AreEqual(const PropertyList& one, const PropertyList& other) {
 }  // namespace
 
 PropertyList::PropertyList() {
-    static const auto empty = std::make_shared<const Dictionary>();
+    // It stays for the life of the process: queues make lists when that is ending, too.
+    static const auto& empty = *new std::shared_ptr<const Dictionary>(new Dictionary);
     value_ = empty;
 }
 

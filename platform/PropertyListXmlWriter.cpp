@@ -1,4 +1,5 @@
 #include <algorithm>
+#include <array>
 #include <string>
 
 #include "platform/PropertyListText.h"
@@ -12,6 +13,13 @@ constexpr std::string_view kHead =
     "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n"
     "<plist version=\"1.0\">\n";
 constexpr std::string_view kTail = "</plist>\n";
+
+/// As many as a line can begin with.
+constexpr auto kTabs = [] {
+    std::array<char, kPropertyListLimits.depth + 1> tabs{};
+    tabs.fill('\t');
+    return tabs;
+}();
 
 using Dictionary = PropertyList::Dictionary;
 using Array = PropertyList::Array;
@@ -39,10 +47,7 @@ private:
         return true;
     }
 
-    bool indent(std::size_t depth) {
-        static const std::string tabs(kPropertyListLimits.depth + 1, '\t');
-        return put(std::string_view(tabs).substr(0, depth));
-    }
+    bool indent(std::size_t depth) { return put(std::string_view(kTabs.data(), depth)); }
 
     bool writeValue(const PropertyList& value, std::size_t depth) {
         if (!budget_.takeObject() || !indent(depth)) {

@@ -62,7 +62,7 @@ public:
 
     [[nodiscard]] int takePlace(const std::string& name) {
         if (renameat2(place_.file().get(),
-                      kName.c_str(),
+                      kName,
                       folder_.get(),
                       name.c_str(),
                       RENAME_NOREPLACE) != 0) {
@@ -73,7 +73,7 @@ public:
     }
 
 private:
-    static inline const std::string kName = "copy";
+    static constexpr const char* kName = "copy";
 
     const OwnedFd& folder_;
     const std::string privateName_;

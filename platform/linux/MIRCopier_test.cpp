@@ -7,6 +7,7 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <array>
 #include <cerrno>
 #include <chrono>
 #include <filesystem>
@@ -313,7 +314,7 @@ TEST_F(ArchiveCopier, DoesNotCopyTheCopyOfADirectoryIntoItself) {
 
 TEST_F(ArchiveCopier, OpensNoSourceThatIsNeitherFileNorDirectory) {
     const std::string special = kPlace + "/special";
-    for (const mode_t type : {S_IFIFO, S_IFSOCK, S_IFCHR}) {
+    for (const mode_t type : std::array<mode_t, 3>{S_IFIFO, S_IFSOCK, S_IFCHR}) {
         fs::remove(special);
         calls.clear();
         if (mknod(special.c_str(), type | 0666, makedev(1, 5)) != 0) {

@@ -397,6 +397,7 @@ TEST_F(LfhelperTest, SwitchesTheHeartbeat) {
             Send(session.port.get(), SimpleReply(8683562, 0));
         });
         const auto outcome = RunProgram(another, isOn ? "heartbeat on" : "heartbeat off");
+        another.finish();
         EXPECT_EQ(outcome.exitStatus, 0) << outcome.output;
         ASSERT_EQ(request.size(), 36U);
         EXPECT_EQ(request[32], isOn ? 1 : 0);
