@@ -61,11 +61,8 @@ public:
     }
 
     [[nodiscard]] int takePlace(const std::string& name) {
-        if (renameat2(place_.file().get(),
-                      kName,
-                      folder_.get(),
-                      name.c_str(),
-                      RENAME_NOREPLACE) != 0) {
+        if (renameat2(place_.file().get(), kName, folder_.get(), name.c_str(), RENAME_NOREPLACE) !=
+            0) {
             return errno;
         }
         isMade_ = false;
