@@ -223,7 +223,9 @@ std::shared_ptr<HttpResponse> Get(const std::string& url,
     LinefoldHttpResult result{};
     TheModule().get(&request, &result);
     if (result.outcome != LINEFOLD_HTTP_DONE && result.detail[0] != '\0') {
-        platform::PlatformLog(LogLevel::kDefault, "%s: %s", url.c_str(), result.detail);
+        // A query may tell where the device is, and is nobody's who reads a log.
+        const std::string place = url.substr(0, url.find('?'));
+        platform::PlatformLog(LogLevel::kDefault, "%s: %s", place.c_str(), result.detail);
     }
     return std::make_shared<HttpResponse>(
         collector.finish(ErrorOf(result.outcome), result.status_code));

@@ -163,6 +163,15 @@ TEST(HttpAnswers, MissWhenNobodyListens) {
     EXPECT_EQ(ErrorOf("http://nobody.vendra.example/"), ErrorType::kHostNotFound);
 }
 
+TEST(HttpAnswers, AreMissedInTheLogWithoutTheQuery) {
+    auto log = phone::LogReader::journal();
+    EXPECT_EQ(ErrorOf("http://127.0.0.1:1/reverse?lat=51.5"), ErrorType::kCannotConnect);
+    const auto lines = log.take();
+    ASSERT_EQ(lines.size(), 1U);
+    EXPECT_TRUE(lines[0].starts_with("5 platform http://127.0.0.1:1/reverse: ")) << lines[0];
+    EXPECT_EQ(lines[0].find("51.5"), std::string::npos);
+}
+
 std::size_t EntriesOf(const char* folder) {
     const std::filesystem::directory_iterator entries(folder);
     return static_cast<std::size_t>(std::distance(begin(entries), end(entries)));
