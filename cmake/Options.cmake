@@ -38,8 +38,14 @@ if(LINEFOLD_FUZZ)
     add_compile_options(-fsanitize=fuzzer-no-link)
 endif()
 if(LINEFOLD_SANITIZE)
+    # Code that checks addresses takes longer to optimise than to run; that of threads is run longer.
+    if(LINEFOLD_SANITIZE MATCHES "thread")
+        set(sanitizer_optimisation -O1)
+    else()
+        set(sanitizer_optimisation -O0)
+    endif()
     add_compile_options(-fsanitize=${LINEFOLD_SANITIZE} -fno-omit-frame-pointer
-                        -fno-sanitize-recover=all -O1)
+                        -fno-sanitize-recover=all ${sanitizer_optimisation} -g1)
     add_link_options(-fsanitize=${LINEFOLD_SANITIZE})
     if(CMAKE_CXX_COMPILER_ID STREQUAL "GNU")
         # What the sanitizers put into the code confuses this one; the other builds have it.

@@ -120,8 +120,14 @@ Attacker::Attacker() {
 }
 
 Attacker::~Attacker() {
+    stop();
+}
+
+void Attacker::stop() {
     isOver_ = true;
-    thread_.join();
+    if (thread_.joinable()) {
+        thread_.join();
+    }
 }
 
 void Attacker::run() {

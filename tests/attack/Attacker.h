@@ -17,6 +17,10 @@ class Attacker {
 public:
     Attacker();
     ~Attacker();
+
+    /// Nothing moves any more. Twice is harmless.
+    void stop();
+
     Attacker(const Attacker&) = delete;
     Attacker& operator=(const Attacker&) = delete;
 

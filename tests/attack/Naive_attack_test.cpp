@@ -22,15 +22,15 @@ TEST(NaivePathAccessUnderAttack, IsLedToWhatIsNotTheMobileUsers) {
 }
 
 TEST(NaiveFileManagerUnderAttack, IsLedToWhatIsNotTheMobileUsers) {
-    bool wasDamaged = false;
-    bool sawCanary = false;
-    for (int round = 0; round < kRoundsMax && !(wasDamaged && sawCanary); ++round) {
-        const Outcome outcome = AttackFileManager(5'000 / kScale);
-        wasDamaged |= !outcome.damage.empty();
-        sawCanary |= outcome.sawCanary > 0;
+    bool isLedAstray = false;
+    // Short rounds, and none after it was led astray: what it has destroyed by then, as root, nobody
+    // can attack any more.
+    constexpr int kShortRoundsMax = 1000;
+    for (int round = 0; round < kShortRoundsMax && !isLedAstray; ++round) {
+        const Outcome outcome = AttackFileManager(200);
+        isLedAstray = !outcome.damage.empty() || outcome.sawCanary > 0;
     }
-    EXPECT_TRUE(wasDamaged);
-    EXPECT_TRUE(sawCanary);
+    EXPECT_TRUE(isLedAstray);
 }
 
 }  // namespace

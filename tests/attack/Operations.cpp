@@ -109,6 +109,7 @@ Outcome AttackPathAccess(int operations) {
         outcome.succeeded += error == 0 ? 1 : 0;
         outcome.refused += error == EPERM ? 1 : 0;
     }
+    attacker.stop();
     outcome.swaps = attacker.swaps();
     outcome.damage = before.differencesTo(Snapshot::take());
     return outcome;
@@ -131,6 +132,7 @@ Outcome AttackFileManager(int operations) {
         outcome.refused += result == EPERM ? 1 : 0;
         outcome.sawCanary += CanariesTaken();
     }
+    attacker.stop();
     outcome.swaps = attacker.swaps();
     outcome.damage = before.differencesTo(Snapshot::take());
     return outcome;
